@@ -1,0 +1,9 @@
+/* Every C-linkage header of kolt compiles as strict C99 on its own. */
+#include "kolt/constants.h"
+#include "kolt/export.h"
+#include "kolt/log.h"
+
+int kolt_c_headers_check(void);
+int kolt_c_headers_check(void) { kolt_log_handler handler = 0;
+  (void)handler;
+  return configKey[0] == 'c'; }
