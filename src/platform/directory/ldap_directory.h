@@ -12,7 +12,8 @@ namespace kolt {
 
 // Opens the node named `nodeName` over LDAP. ldapi socket paths are mapped
 // below `env`'s root. Null with `error` (directory domain) on failure.
-std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeName, ErrorSlot* error);
+std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeName,
+                                            ErrorSlot* error);
 
 }  // namespace kolt
 
