@@ -6,6 +6,7 @@
 #include <poll.h>
 #include <signal.h>
 #include <sys/resource.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -216,60 +217,79 @@ class SigpipeGuard {
   bool raised_ = false;
 };
 
-// Feeds the input and drains both outputs at once.
-int pump(Fd* in, std::string_view input, Fd* out, Fd* err, std::string* output,
+// True once `pid` has exited; it stays waitable (not reaped).
+bool hasExited(pid_t pid) {
+  siginfo_t info{};
+  return ::waitid(P_PID, static_cast<id_t>(pid), &info, WEXITED | WNOHANG | WNOWAIT) == 0 &&
+         info.si_pid == pid;
+}
+
+// Reads what is available now; returns false at end of file or on error.
+bool drainAvailable(Fd* fd, std::string* sink) {
+  char buffer[65536];
+  for (;;) {
+    const ssize_t n = ::read(fd->get(), buffer, sizeof buffer);
+    if (n > 0) {
+      sink->append(buffer, static_cast<std::size_t>(n));
+      continue;
+    }
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0 && errno == EAGAIN) return true;
+    fd->reset();
+    return false;
+  }
+}
+
+// Feeds the input and drains both outputs at once, until both outputs end or
+// the child has exited: a grandchild that keeps the child's output open (a
+// tool that starts a daemon) must not hold the caller.
+int pump(pid_t pid, Fd* in, std::string_view input, Fd* out, Fd* err, std::string* output,
          std::string* errorOutput) {
   SigpipeGuard guard;
   if (in->valid()) {
     if (input.empty() || ::fcntl(in->get(), F_SETFL, O_NONBLOCK) != 0) in->reset();
   }
-  char buffer[65536];
-  while (in->valid() || out->valid() || err->valid()) {
-    struct pollfd fds[3];
-    Fd* owners[3];
-    std::string* sinks[3] = {nullptr, nullptr, nullptr};
+  for (Fd* fd : {out, err}) {
+    if (fd->valid()) ::fcntl(fd->get(), F_SETFL, O_NONBLOCK);
+  }
+  // The child's exit wakes poll through a pid descriptor; without one we
+  // look every 100 ms.
+  Fd exitFd(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
+  bool exited = false;
+  while (!exited && (in->valid() || out->valid() || err->valid())) {
+    struct pollfd fds[4];
     nfds_t count = 0;
-    if (in->valid()) {
-      fds[count] = {in->get(), POLLOUT, 0};
-      owners[count++] = in;
-    }
-    if (out->valid()) {
-      fds[count] = {out->get(), POLLIN, 0};
-      sinks[count] = output;
-      owners[count++] = out;
-    }
-    if (err->valid()) {
-      fds[count] = {err->get(), POLLIN, 0};
-      sinks[count] = errorOutput;
-      owners[count++] = err;
-    }
-    if (::poll(fds, count, -1) < 0) {
+    const auto add = [&](const Fd& fd, short events) {
+      fds[count++] = {fd.valid() ? fd.get() : -1, events, 0};
+    };
+    add(*in, POLLOUT);
+    add(*out, POLLIN);
+    add(*err, POLLIN);
+    add(exitFd, POLLIN);
+    const int ready = ::poll(fds, count, exitFd.valid() ? -1 : 100);
+    if (ready < 0) {
       if (errno == EINTR) continue;
       return errno;
     }
-    for (nfds_t i = 0; i < count; ++i) {
-      if (fds[i].revents == 0) continue;
-      if (owners[i] == in) {
-        const ssize_t n =
-            ::write(in->get(), input.data(), std::min<std::size_t>(input.size(), 65536));
-        if (n > 0) {
-          input.remove_prefix(static_cast<std::size_t>(n));
-          if (input.empty()) in->reset();
-        } else if (n < 0 && errno != EINTR && errno != EAGAIN) {
-          // The child stopped reading: the rest of the input is dropped.
-          if (errno == EPIPE) guard.noteRaised();
-          in->reset();
-        }
-      } else {
-        const ssize_t n = ::read(owners[i]->get(), buffer, sizeof buffer);
-        if (n > 0) {
-          sinks[i]->append(buffer, static_cast<std::size_t>(n));
-        } else if (n == 0 || (errno != EINTR && errno != EAGAIN)) {
-          owners[i]->reset();
-        }
+    if (fds[0].revents != 0) {
+      const ssize_t n =
+          ::write(in->get(), input.data(), std::min<std::size_t>(input.size(), 65536));
+      if (n > 0) {
+        input.remove_prefix(static_cast<std::size_t>(n));
+        if (input.empty()) in->reset();
+      } else if (n < 0 && errno != EINTR && errno != EAGAIN) {
+        // The child stopped reading: the rest of the input is dropped.
+        if (errno == EPIPE) guard.noteRaised();
+        in->reset();
       }
     }
+    if (fds[1].revents != 0) drainAvailable(out, output);
+    if (fds[2].revents != 0) drainAvailable(err, errorOutput);
+    exited = exitFd.valid() ? fds[3].revents != 0 : hasExited(pid);
   }
+  // Whatever the child wrote before it exited is in the pipes now.
+  if (out->valid()) drainAvailable(out, output);
+  if (err->valid()) drainAvailable(err, errorOutput);
   return 0;
 }
 
@@ -361,8 +381,8 @@ int startProcess(const HostProcess& process, bool wait, ProcessResult* result) {
     return report.value;
   }
   result->pid = pid;
-  const int pumpRc =
-      pump(&parentIn, process.input, &parentOut, &parentErr, &result->output, &result->errorOutput);
+  const int pumpRc = pump(pid, &parentIn, process.input, &parentOut, &parentErr, &result->output,
+                          &result->errorOutput);
   parentIn.reset();
   parentOut.reset();
   parentErr.reset();

@@ -1,5 +1,6 @@
 // PosixEnv's child processes, driven through the recording stand-in.
 #include <fcntl.h>
+#include <signal.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -105,6 +106,24 @@ TEST(PosixEnvProcess, ChildThatStopsReadingItsInputDoesNotKillTheCaller) {
   spec = specFor("/bin/sh", {"-c", "kill -TERM $$"});
   ASSERT_EQ(box.env().runProcess(spec, true, &result), 0);
   EXPECT_EQ(result.exitStatus, 128 + SIGTERM);
+}
+
+TEST(PosixEnvProcess, AWaitedChildThatLeavesADaemonHoldingItsOutputStillEnds) {
+  Sandbox box;
+  box.makeDirectory("/bin");
+  ASSERT_EQ(::symlink("/bin/sh", box.hostPath("/bin/sh").c_str()), 0);
+  // The background job keeps both output pipes open long after its parent
+  // has exited.
+  ProcessSpec spec = specFor("/bin/sh", {"-c", "sleep 1000 & echo $!; echo started >&2; exit 6"});
+  spec.standardOutput = StreamSpec::pipe();
+  spec.standardError = StreamSpec::pipe();
+  ProcessResult result;
+  ASSERT_EQ(box.env().runProcess(spec, true, &result), 0);
+  const pid_t daemon = static_cast<pid_t>(std::atol(result.output.c_str()));
+  if (daemon > 1) ::kill(daemon, SIGKILL);
+  EXPECT_GT(daemon, 1);
+  EXPECT_EQ(result.errorOutput, "started\n");
+  EXPECT_EQ(result.exitStatus, 6);
 }
 
 TEST(PosixEnvProcess, ChildSeesOnlyItsStandardStreamsAndTheSandboxRoot) {
