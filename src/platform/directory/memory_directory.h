@@ -7,7 +7,8 @@
 // records. It is thread-safe.
 //
 // Access rules (those of the example ACLs in schema/):
-//   - anonymous sessions may only bind; they see no record;
+//   - anonymous sessions may only bind; they see no record, and every
+//     write fails with 8 (strongerAuthRequired), as slapd answers;
 //   - the administrator (a user named at construction) reads and writes all;
 //   - an ldapi:// node without credentials is the local superuser, with the
 //     administrator's rights (SASL EXTERNAL as root);
