@@ -16,9 +16,13 @@ const char* kRootDseAttributes[] = {"namingContexts", nullptr};
 const char* kNoAttributes[] = {LDAP_NO_ATTRS, nullptr};
 
 // SASL EXTERNAL asks nothing; any prompt gets the default answer.
-int noInteraction(LDAP*, unsigned, void*, void*) { return LDAP_SUCCESS; }
+int noInteraction(LDAP*, unsigned, void*, void*) {
+  return LDAP_SUCCESS;
+}
 
-timeval operationTimeout() { return {kLdapOperationTimeoutSeconds, 0}; }
+timeval operationTimeout() {
+  return {kLdapOperationTimeoutSeconds, 0};
+}
 
 }  // namespace
 

@@ -21,14 +21,19 @@ constexpr const char* kUserClass = "inetOrgPerson";
 constexpr const char* kGroupClass = "vornGroup";
 constexpr const char* kPlistAttribute = "vornXMLPlist";
 
-const char* nameAttribute(RecordType type) { return type == RecordType::kUsers ? "uid" : "cn"; }
+const char* nameAttribute(RecordType type) {
+  return type == RecordType::kUsers ? "uid" : "cn";
+}
 
 // The LDAP attribute that holds `attribute` in a record of `type`.
 const char* ldapAttribute(RecordType type, Attribute attribute) {
   switch (attribute) {
-    case Attribute::kRecordName: return nameAttribute(type);
-    case Attribute::kFullName: return type == RecordType::kUsers ? "cn" : "displayName";
-    case Attribute::kXMLPlist: return kPlistAttribute;
+    case Attribute::kRecordName:
+      return nameAttribute(type);
+    case Attribute::kFullName:
+      return type == RecordType::kUsers ? "cn" : "displayName";
+    case Attribute::kXMLPlist:
+      return kPlistAttribute;
   }
   return kPlistAttribute;
 }
@@ -123,7 +128,9 @@ class LdapRecord final : public DirectoryRecord {
  public:
   LdapRecord(std::shared_ptr<LdapConnection> connection, RecordType type, std::string dn,
              std::string name)
-      : connection_(std::move(connection)), type_(type), dn_(std::move(dn)),
+      : connection_(std::move(connection)),
+        type_(type),
+        dn_(std::move(dn)),
         name_(std::move(name)) {
     views_[Attribute::kRecordName] = {name_};
   }
@@ -150,7 +157,7 @@ class LdapRecord final : public DirectoryRecord {
   const std::string& recordName() const override { return name_; }
 
   std::optional<std::vector<std::string_view>> valuesForAttribute(Attribute attribute,
-                                                                   ErrorSlot* error) override {
+                                                                  ErrorSlot* error) override {
     if (auto it = views_.find(attribute); it != views_.end()) return it->second;
     std::lock_guard lock(connection_->mutex());
     if (auto e = connection_->ready()) return fail(error, std::move(*e));
@@ -158,15 +165,16 @@ class LdapRecord final : public DirectoryRecord {
     const char* attrs[] = {ldapAttribute(type_, attribute), nullptr};
     LDAPMessage* result = nullptr;
     timeval timeout{kLdapOperationTimeoutSeconds, 0};
-    const int rc = ldap_search_ext_s(ld, dn_.c_str(), LDAP_SCOPE_BASE, "(objectClass=*)",
-                                     const_cast<char**>(attrs), 0, nullptr, nullptr, &timeout, 1,
-                                     &result);
+    const int rc =
+        ldap_search_ext_s(ld, dn_.c_str(), LDAP_SCOPE_BASE, "(objectClass=*)",
+                          const_cast<char**>(attrs), 0, nullptr, nullptr, &timeout, 1, &result);
     Message message(result, ldap_msgfree);
     if (rc != LDAP_SUCCESS) return fail(error, connection_->error(rc));
     LDAPMessage* entry = ldap_first_entry(ld, result);
     ValueViews views;
     if (entry == nullptr) return fail(error, directoryError(LDAP_NO_SUCH_OBJECT));
-    if (!readEntry(ld, entry, type_, &views)) return fail(error, connection_->error(LDAP_DECODING_ERROR));
+    if (!readEntry(ld, entry, type_, &views))
+      return fail(error, connection_->error(LDAP_DECODING_ERROR));
     adopt(std::move(message), std::move(views));
     fetched(attribute);
     return views_[attribute];
@@ -181,8 +189,8 @@ class LdapRecord final : public DirectoryRecord {
     if (auto e = connection_->ready()) return failed(error, std::move(*e));
     Modifications mods;
     mods.add(LDAP_MOD_REPLACE, ldapAttribute(type_, attribute), values);
-    const int rc = ldap_modify_ext_s(connection_->handle(), dn_.c_str(), mods.get(), nullptr,
-                                     nullptr);
+    const int rc =
+        ldap_modify_ext_s(connection_->handle(), dn_.c_str(), mods.get(), nullptr, nullptr);
     if (rc != LDAP_SUCCESS) return failed(error, connection_->error(rc));
     own(attribute, values);
     return true;
@@ -190,8 +198,8 @@ class LdapRecord final : public DirectoryRecord {
 
   bool synchronize(ErrorSlot*) override { return true; }  // every change is stored at once
 
-  bool changePassword(const std::optional<std::string>& oldPassword,
-                      const std::string& newPassword, ErrorSlot* error) override {
+  bool changePassword(const std::optional<std::string>& oldPassword, const std::string& newPassword,
+                      ErrorSlot* error) override {
     if (type_ != RecordType::kUsers) {
       return failed(error, directoryError(LDAP_NOT_SUPPORTED, "only users have passwords"));
     }
@@ -204,8 +212,8 @@ class LdapRecord final : public DirectoryRecord {
     berval user{static_cast<ber_len_t>(dn_.size()), dn_.data()};
     berval next{static_cast<ber_len_t>(newPassword.size()), const_cast<char*>(newPassword.data())};
     berval old{0, nullptr};
-    if (oldPassword) old = {static_cast<ber_len_t>(oldPassword->size()),
-                            const_cast<char*>(oldPassword->data())};
+    if (oldPassword)
+      old = {static_cast<ber_len_t>(oldPassword->size()), const_cast<char*>(oldPassword->data())};
     berval generated{0, nullptr};
     const int rc = ldap_passwd_s(connection_->handle(), &user, oldPassword ? &old : nullptr, &next,
                                  &generated, nullptr, nullptr);
@@ -223,8 +231,8 @@ class LdapRecord final : public DirectoryRecord {
     if (auto e = connection_->ready()) return failed(error, std::move(*e));
     Modifications mods;
     mods.add(LDAP_MOD_ADD, "member", {user->dn_});
-    const int rc = ldap_modify_ext_s(connection_->handle(), dn_.c_str(), mods.get(), nullptr,
-                                     nullptr);
+    const int rc =
+        ldap_modify_ext_s(connection_->handle(), dn_.c_str(), mods.get(), nullptr, nullptr);
     // Already a member: nothing to do.
     if (rc != LDAP_SUCCESS && rc != LDAP_TYPE_OR_VALUE_EXISTS) {
       return failed(error, connection_->error(rc));
@@ -297,9 +305,9 @@ class LdapNode final : public DirectoryNode {
     LDAPMessage* result = nullptr;
     timeval timeout{kLdapOperationTimeoutSeconds, 0};
     const int limit = maxResults > 0x7fffffff ? 0 : static_cast<int>(maxResults);
-    const int rc = ldap_search_ext_s(ld, container.c_str(), LDAP_SCOPE_ONELEVEL, filter.c_str(),
-                                     const_cast<char**>(attrs), 0, nullptr, nullptr, &timeout,
-                                     limit, &result);
+    const int rc =
+        ldap_search_ext_s(ld, container.c_str(), LDAP_SCOPE_ONELEVEL, filter.c_str(),
+                          const_cast<char**>(attrs), 0, nullptr, nullptr, &timeout, limit, &result);
     Message message(result, ldap_msgfree);
     std::vector<std::unique_ptr<DirectoryRecord>> records;
     // A container the session may not see holds nothing it may read.
@@ -312,8 +320,7 @@ class LdapNode final : public DirectoryNode {
       setError(error, connection_->error(rc));
       return std::nullopt;
     }
-    for (LDAPMessage* e = ldap_first_entry(ld, result); e != nullptr;
-         e = ldap_next_entry(ld, e)) {
+    for (LDAPMessage* e = ldap_first_entry(ld, result); e != nullptr; e = ldap_next_entry(ld, e)) {
       const std::string dn = entryDn(ld, e);
       ValueViews views;
       if (!readEntry(ld, e, type, &views)) {

@@ -14,7 +14,8 @@ namespace kolt {
 // A node over LDAP (libldap). Opening only checks the name (-9 when it is
 // no node name); the first operation connects. ldapi socket paths and kolt's
 // trust store are mapped below `env`'s root; `env` must outlive the node.
-std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeName, ErrorSlot* error);
+std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeName,
+                                            ErrorSlot* error);
 
 }  // namespace kolt
 

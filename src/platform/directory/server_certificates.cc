@@ -35,7 +35,9 @@ class Socket {
   int fd_;
 };
 
-std::string where(const NodeAddress& a) { return a.host + ":" + std::to_string(a.port); }
+std::string where(const NodeAddress& a) {
+  return a.host + ":" + std::to_string(a.port);
+}
 
 // A connected TCP socket with send and receive time-outs, or -1.
 int connectWithTimeout(const NodeAddress& address, int timeoutSeconds, std::string* why) {
@@ -50,8 +52,8 @@ int connectWithTimeout(const NodeAddress& address, int timeoutSeconds, std::stri
   }
   int result = -1;
   for (addrinfo* ai = list; ai != nullptr && result < 0; ai = ai->ai_next) {
-    const int fd = ::socket(ai->ai_family, ai->ai_socktype | SOCK_CLOEXEC | SOCK_NONBLOCK,
-                            ai->ai_protocol);
+    const int fd =
+        ::socket(ai->ai_family, ai->ai_socktype | SOCK_CLOEXEC | SOCK_NONBLOCK, ai->ai_protocol);
     if (fd < 0) continue;
     int rc = ::connect(fd, ai->ai_addr, ai->ai_addrlen);
     if (rc != 0 && errno == EINPROGRESS) {
@@ -59,8 +61,7 @@ int connectWithTimeout(const NodeAddress& address, int timeoutSeconds, std::stri
       rc = ::poll(&p, 1, timeoutSeconds * 1000);
       int soError = 0;
       socklen_t len = sizeof soError;
-      if (rc == 1 && ::getsockopt(fd, SOL_SOCKET, SO_ERROR, &soError, &len) == 0 &&
-          soError == 0) {
+      if (rc == 1 && ::getsockopt(fd, SOL_SOCKET, SO_ERROR, &soError, &len) == 0 && soError == 0) {
         rc = 0;
       } else {
         errno = rc == 0 ? ETIMEDOUT : (soError != 0 ? soError : errno);
@@ -98,8 +99,8 @@ bool readExactly(int fd, unsigned char* buffer, std::size_t length) {
 int startTls(int fd, std::string* diagnostic) {
   std::unique_ptr<BerElement, void (*)(BerElement*)> request(ber_alloc_t(LBER_USE_DER),
                                                              [](BerElement* b) { ber_free(b, 1); });
-  if (!request || ber_printf(request.get(), "{it{ts}}", 1, LDAP_REQ_EXTENDED,
-                             LDAP_TAG_EXOP_REQ_OID, LDAP_EXOP_START_TLS) < 0) {
+  if (!request || ber_printf(request.get(), "{it{ts}}", 1, LDAP_REQ_EXTENDED, LDAP_TAG_EXOP_REQ_OID,
+                             LDAP_EXOP_START_TLS) < 0) {
     return LDAP_ENCODING_ERROR;
   }
   berval* flat = nullptr;
@@ -128,8 +129,8 @@ int startTls(int fd, std::string* diagnostic) {
   }
   // Decode the body alone: msgid, then [APPLICATION 24] with the result.
   berval bv{static_cast<ber_len_t>(body.size()), body.data()};
-  std::unique_ptr<BerElement, void (*)(BerElement*)> response(ber_init(&bv),
-                                                              [](BerElement* b) { ber_free(b, 1); });
+  std::unique_ptr<BerElement, void (*)(BerElement*)> response(
+      ber_init(&bv), [](BerElement* b) { ber_free(b, 1); });
   ber_int_t msgid = 0;
   ber_int_t resultCode = 0;
   ber_len_t elementLength = 0;
@@ -181,8 +182,8 @@ std::optional<Error> fetchServerCaCertificates(const NodeAddress& address, int t
     std::string diagnostic;
     const int rc = startTls(socket.fd(), &diagnostic);
     if (rc != LDAP_SUCCESS) {
-      return directoryError(rc, "StartTLS with " + where(address) +
-                                    (diagnostic.empty() ? "" : ": " + diagnostic));
+      return directoryError(
+          rc, "StartTLS with " + where(address) + (diagnostic.empty() ? "" : ": " + diagnostic));
     }
   }
   std::unique_ptr<SSL_CTX, decltype(&SSL_CTX_free)> ctx(SSL_CTX_new(TLS_client_method()),
