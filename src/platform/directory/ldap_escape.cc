@@ -61,7 +61,7 @@ std::string escapeFilterValue(std::string_view value) {
   berval out{0, nullptr};
   if (ldap_bv2escaped_filter_value(&in, &out) != 0 || out.bv_val == nullptr) {
     // Only an allocation failure gets here; escape by hand then.
-    static const char* kHex = "0123456789abcdef";
+    static const char* kHex = "0123456789ABCDEF";
     std::string text;
     for (unsigned char c : value) {
       text += '\\';

@@ -18,7 +18,7 @@ namespace kolt {
 std::string escapeDnValue(std::string_view value);
 
 // `value` as a filter assertion value (RFC 4515): * ( ) \ NUL and every
-// non-ASCII byte become \xx (libldap's ldap_bv2escaped_filter_value).
+// non-ASCII byte become \XX (libldap's ldap_bv2escaped_filter_value).
 std::string escapeFilterValue(std::string_view value);
 
 // The value of the first RDN of `dn` (unescaped), when `dn` parses as an
