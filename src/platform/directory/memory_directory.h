@@ -17,6 +17,8 @@
 //   - a record the session may not read looks absent.
 // Record names match like LDAP's uid and cn: ASCII letters ignore case,
 // leading and trailing blanks are insignificant, runs of blanks count as one.
+// There is no transport: TLS, trust and the StartTLS rule are the LDAP
+// client's alone (the custom call only records the server as trusted).
 #ifndef KOLT_PLATFORM_DIRECTORY_MEMORY_DIRECTORY_H
 #define KOLT_PLATFORM_DIRECTORY_MEMORY_DIRECTORY_H
 
