@@ -227,6 +227,9 @@ class MemoryRecord final : public DirectoryRecord {
   // Why the session may not write the record, if it may not.
   std::optional<Error> writableLocked() {
     const bool readable = readableEntryLocked() != nullptr;
+    if (session_->identity == Session::Identity::kAnonymous) {
+      return directoryError(LDAP_STRONG_AUTH_REQUIRED, "modifications require authentication");
+    }
     if (!canWrite(*dir_, *session_)) {
       return directoryError(LDAP_INSUFFICIENT_ACCESS, "no write access");
     }
@@ -315,6 +318,11 @@ class MemoryNode final : public DirectoryNode {
     std::lock_guard lock(dir_->mutex());
     if (auto e = dir_->enterLocked(DirectoryOperation::kCreateRecord, session_.get())) {
       setError(error, std::move(*e));
+      return nullptr;
+    }
+    if (session_->identity == Session::Identity::kAnonymous) {
+      setError(error,
+               directoryError(LDAP_STRONG_AUTH_REQUIRED, "modifications require authentication"));
       return nullptr;
     }
     if (!canWrite(*dir_, *session_)) {

@@ -7,7 +7,8 @@
 // records. It is thread-safe.
 //
 // Access rules (those of the example ACLs in schema/):
-//   - anonymous sessions may only bind; they see no record;
+//   - anonymous sessions may only bind; they see no record, and every
+//     write fails with 8 (strongerAuthRequired), as slapd answers;
 //   - the administrator (a user named at construction) reads and writes all;
 //   - an ldapi:// node without credentials is the local superuser, with the
 //     administrator's rights (SASL EXTERNAL as root);
@@ -16,6 +17,8 @@
 //   - a record the session may not read looks absent.
 // Record names match like LDAP's uid and cn: ASCII letters ignore case,
 // leading and trailing blanks are insignificant, runs of blanks count as one.
+// There is no transport: TLS, trust and the StartTLS rule are the LDAP
+// client's alone (the custom call only records the server as trusted).
 #ifndef KOLT_PLATFORM_DIRECTORY_MEMORY_DIRECTORY_H
 #define KOLT_PLATFORM_DIRECTORY_MEMORY_DIRECTORY_H
 
