@@ -28,7 +28,9 @@ void civilFromDays(std::int64_t z, std::int64_t* y, int* m, int* d) {
   *y = yoe + era * 400 + (*m <= 2);
 }
 
-bool isLeap(std::int64_t y) { return (y % 4 == 0 && y % 100 != 0) || y % 400 == 0; }
+bool isLeap(std::int64_t y) {
+  return (y % 4 == 0 && y % 100 != 0) || y % 400 == 0;
+}
 
 int daysInMonth(std::int64_t y, int m) {
   static const int kDays[] = {31, 28, 31, 30, 31, 30, 31, 31, 30, 31, 30, 31};
@@ -85,8 +87,8 @@ CivilTime civilFromSeconds(double secondsSince2001) {
 
 std::string formatIso8601(double secondsSince2001) {
   const CivilTime t = civilFromSeconds(secondsSince2001);
-  return formatCivil(t, t.year < 0 ? "%05lld-%02d-%02dT%02d:%02d:%02dZ"
-                                   : "%04lld-%02d-%02dT%02d:%02d:%02dZ");
+  return formatCivil(
+      t, t.year < 0 ? "%05lld-%02d-%02dT%02d:%02d:%02dZ" : "%04lld-%02d-%02dT%02d:%02d:%02dZ");
 }
 
 std::string formatForDescription(double secondsSince2001) {

@@ -12,8 +12,8 @@ namespace kolt::calendar {
 
 struct CivilTime {
   std::int64_t year = 2001;
-  int month = 1;   // 1..12
-  int day = 1;     // 1..31
+  int month = 1;  // 1..12
+  int day = 1;    // 1..31
   int hour = 0;
   int minute = 0;
   int second = 0;

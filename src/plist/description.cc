@@ -27,11 +27,21 @@ void appendQuoted(std::string& out, std::string_view s) {
   out += '"';
   for (unsigned char c : s) {
     switch (c) {
-      case '"': out += "\\\""; break;
-      case '\\': out += "\\\\"; break;
-      case '\n': out += "\\n"; break;
-      case '\t': out += "\\t"; break;
-      case '\r': out += "\\r"; break;
+      case '"':
+        out += "\\\"";
+        break;
+      case '\\':
+        out += "\\\\";
+        break;
+      case '\n':
+        out += "\\n";
+        break;
+      case '\t':
+        out += "\\t";
+        break;
+      case '\r':
+        out += "\\r";
+        break;
       default:
         if (c < 0x20 || c == 0x7f) {
           static const char kHex[] = "0123456789ABCDEF";
@@ -46,7 +56,9 @@ void appendQuoted(std::string& out, std::string_view s) {
   out += '"';
 }
 
-void indent(std::string& out, int level) { out.append(static_cast<std::size_t>(level) * 4, ' '); }
+void indent(std::string& out, int level) {
+  out.append(static_cast<std::size_t>(level) * 4, ' ');
+}
 
 void describe(std::string& out, const Value& v, int level, bool topLevel) {
   switch (v.type()) {

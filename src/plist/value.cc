@@ -7,7 +7,9 @@
 namespace kolt {
 namespace {
 
-bool keyLess(const Dictionary::Entry& e, std::string_view key) { return e.first < key; }
+bool keyLess(const Dictionary::Entry& e, std::string_view key) {
+  return e.first < key;
+}
 
 // The numeric value of an integer as a 128-bit signed number.
 __int128 wide(const Integer& i) {
@@ -62,8 +64,9 @@ bool Dictionary::erase(std::string_view key) {
 
 Dictionary Dictionary::fromEntries(std::vector<Entry> entries) {
   Dictionary d;
-  const bool sorted = std::is_sorted(entries.begin(), entries.end(),
-                                     [](const Entry& a, const Entry& b) { return a.first < b.first; });
+  const bool sorted =
+      std::is_sorted(entries.begin(), entries.end(),
+                     [](const Entry& a, const Entry& b) { return a.first < b.first; });
   if (!sorted) {
     std::stable_sort(entries.begin(), entries.end(),
                      [](const Entry& a, const Entry& b) { return a.first < b.first; });
@@ -94,7 +97,9 @@ Dictionary Dictionary::fromEntries(std::vector<Entry> entries) {
   return d;
 }
 
-bool operator==(const Dictionary& a, const Dictionary& b) { return a.entries_ == b.entries_; }
+bool operator==(const Dictionary& a, const Dictionary& b) {
+  return a.entries_ == b.entries_;
+}
 
 // --- Value --------------------------------------------------------------------
 
