@@ -2,6 +2,8 @@
 #include <gtest/gtest.h>
 
 #include "config/hosted_volume_list.h"
+#include "fixtures/sandbox.h"
+#include "kolt/controller_helpers.h"
 
 namespace kolt {
 namespace {
@@ -39,6 +41,16 @@ TEST(HostedVolumeListText, WrittenLinesReadBack) {
   const std::string text = hostedVolumeLine("vol1") + hostedVolumeLine("Projekt-\xC3\x9C");
   EXPECT_EQ(text, "vol1 . 0\nProjekt-\xC3\x9C . 0\n");
   EXPECT_EQ(parseHostedVolumeList(text), strings({"vol1", "Projekt-\xC3\x9C"}));
+}
+
+TEST(HostedVolumeList, ReadsFsmlistAndTreatsAnUnreadableOneAsEmpty) {
+  testing::Sandbox sandbox;
+  EXPECT_TRUE(getHostedVolumeList().empty());
+  sandbox.writeFile(kFsmlistPath, "vol1 . 0\n\n  vol2 . 0\nvol3");
+  EXPECT_EQ(getHostedVolumeList(), strings({"vol1", "vol3"}));
+  sandbox.removeFile(kFsmlistPath);
+  sandbox.makeDirectory(kFsmlistPath);  // a directory cannot be read as text
+  EXPECT_TRUE(getHostedVolumeList().empty());
 }
 
 }  // namespace
