@@ -128,12 +128,11 @@ void updateFromVolumeConfig(const Value& volumes) {
   }
   log("Hosted set is %@", printableSet(hostedBefore));
 
-  static const Dictionary kNoVolumes;
-  const Dictionary* table = volumes.asDictionary();
-  for (const auto& [volume, entry] : table ? *table : kNoVolumes) {
+  const Dictionary noVolumes;
+  const Dictionary& table = volumes.asDictionary() ? *volumes.asDictionary() : noVolumes;
+  for (const auto& [volume, entry] : table) {
     if (!isUsableVolumeName(volume)) {
       NError("Volume name '%@' cannot name a file. Ignoring", printableVolumeName(volume));
-      local.stale.erase(volume);
       continue;
     }
     const auto localDate = local.dates.find(volume);
@@ -156,7 +155,8 @@ void updateFromVolumeConfig(const Value& volumes) {
   }
 
   for (const std::string& volume : local.stale) {
-    // Hidden or oddly named files are no volume's configuration.
+    // Hidden or oddly named files are no usable volume's configuration, and
+    // a skipped volume's file stays.
     if (isUsableVolumeName(volume)) env.removeFile(cfgpPath(volume));
   }
 
