@@ -81,7 +81,8 @@ KOLT_EXPORT Value redactVornSecrets(const Value& document);
 // "/"-separated piece is the host, or a bare host[:port]). Opens the node
 // "/LDAPv3/ldap://<host>" through the current Env and makes the custom call
 // kCustomCallClientAddCACerts on it, which stores the server's CA
-// certificates in the library's trust directory. Then asks the service
+// certificates in the library's trust directory; when that fails for an
+// "ldaps://" URL, asks "/LDAPv3/ldaps://<host>" the same. Then asks the service
 // registry to send SIGTERM to "com.orvat.opendirectoryd" and waits 3 seconds
 // (on the Env's clock) when that worked. Failures appear only as log lines
 // ("ClientAddCACerts returned %@", "Unable to kill opendirectoryd. If Vorn

@@ -25,6 +25,13 @@ std::optional<std::string> hostOfDirectoryURL(const std::string& url) {
   return url.substr(start, url.find('/', start) - start);
 }
 
+// Opens the node and makes the custom call; both share one error slot, and a
+// node that does not open gets no call.
+bool trustServerCertificates(Env& env, const std::string& nodeName, ErrorSlot* error) {
+  std::unique_ptr<DirectoryNode> node = env.openDirectoryNode(nodeName, error);
+  return node && node->customCall(kCustomCallClientAddCACerts, error);
+}
+
 }  // namespace
 
 void loadControllerCerts(const std::string& url) {
@@ -34,8 +41,14 @@ void loadControllerCerts(const std::string& url) {
 
   Env& env = currentEnv();
   ErrorSlot error;
-  std::unique_ptr<DirectoryNode> node = env.openDirectoryNode("/LDAPv3/ldap://" + *host, &error);
-  if (node) node->customCall(kCustomCallClientAddCACerts, &error);
+  // An ldap:// node fetches the certificates after StartTLS, which a server
+  // that speaks TLS from the first byte refuses. When the URL says ldaps, the
+  // host:port is such a server: ask it that way too.
+  if (!trustServerCertificates(env, "/LDAPv3/ldap://" + *host, &error) &&
+      url.compare(0, 8, "ldaps://") == 0) {
+    error.reset();
+    trustServerCertificates(env, "/LDAPv3/ldaps://" + *host, &error);
+  }
   if (error) log("ClientAddCACerts returned %@", *error);
 
   if (env.signalJob(kDirectoryServiceLabel, SIGTERM) != 0) {

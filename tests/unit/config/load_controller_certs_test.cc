@@ -112,6 +112,15 @@ TEST_F(LoadControllerCertsTest, FailuresAreLoggedAndAClosedNodeGetsNoCall) {
   EXPECT_TRUE(logs_.contains("no server"));
 }
 
+TEST_F(LoadControllerCertsTest, AnLdapsServerThatRefusesStartTlsIsAskedOverTls) {
+  env_.failCustomCall = true;
+  loadControllerCerts("ldaps://10.1.2.3:636/base");
+  EXPECT_EQ(env_.openedNodes, (std::vector<std::string>{"/LDAPv3/ldap://10.1.2.3:636",
+                                                        "/LDAPv3/ldaps://10.1.2.3:636"}));
+  EXPECT_EQ(env_.customCalls, (std::vector<int>{98000, 98000}));
+  EXPECT_TRUE(logs_.contains("ClientAddCACerts returned "));
+}
+
 TEST_F(LoadControllerCertsTest, WithoutTheDaemonItSaysSoAndDoesNotWait) {
   loadControllerCerts("ldap://10.0.0.1");
   EXPECT_TRUE(
