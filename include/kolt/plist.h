@@ -66,13 +66,14 @@ class KOLT_EXPORT Dictionary {
   // Removes `key`; returns whether it was present.
   bool erase(std::string_view key);
 
-  std::size_t size() const { return entries_.size(); }
-  bool empty() const { return entries_.empty(); }
+  // Defined after Value, which must be complete for them (clang insists).
+  std::size_t size() const;
+  bool empty() const;
   const_iterator begin() const { return entries_.begin(); }
   const_iterator end() const { return entries_.end(); }
   iterator begin() { return entries_.begin(); }
   iterator end() { return entries_.end(); }
-  void clear() { entries_.clear(); }
+  void clear();
 
   // Builds a dictionary from entries in any order; a later duplicate key
   // replaces an earlier one. Used by the readers.
@@ -173,6 +174,10 @@ class KOLT_EXPORT Value {
   };
   std::variant<Dictionary, Array, std::string, Integer, double, Boolean, Date, Data> v_;
 };
+
+inline std::size_t Dictionary::size() const { return entries_.size(); }
+inline bool Dictionary::empty() const { return entries_.empty(); }
+inline void Dictionary::clear() { entries_.clear(); }
 
 // Limits that every reader enforces. A document that exceeds one is rejected
 // with an error; nothing partial is returned.
