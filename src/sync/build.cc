@@ -13,8 +13,9 @@
 #include "kolt/local_config.h"
 #include "kolt/log.h"
 #include "sync/metadata_address.h"
-#include "volumes/name_servers.h"
-#include "volumes/value_files.h"
+#include "kolt/volume_files.h"
+#include "volumes/key_operations.h"
+#include "volumes/nameservers.h"
 #include "volumes/volume_collection.h"
 
 namespace kolt {
@@ -162,9 +163,9 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
   Value& globals = globalsOf(*record);
 
   std::uint8_t copied = 0;
-  for (const char* key : kPublishedKeys) copyValue(globals, *local, key, &copied);
-  update_from_file(globals, ".auth_secret", "sharedSecret", &copied);
-  update_from_file(globals, "fsports", "fsports", &copied);
+  for (const char* key : kPublishedKeys) copyValue(globals.asDictionary(), *local->asDictionary(), key, &copied);
+  update_from_file(globals.asDictionary(), ".auth_secret", "sharedSecret", &copied);
+  update_from_file(globals.asDictionary(), "fsports", "fsports", &copied);
   if (copied & 1) flags |= kBuildPublish;
 
   const Value* previousControllers = globals.find("controllers");
@@ -173,12 +174,10 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
   const bool hadControllers = previousControllers != nullptr;
   const Value before = hadControllers ? *previousControllers : Value();
   if (const Value* computers = local->find("computers")) {
-    Value found = migrateComputersToControllers(*computers, read_fsnameservers(nullptr),
-                                                globals.find("aliasControllers"));
-    log("foundControllers %@", found);
-    if (const Dictionary* entries = found.asDictionary()) {
-      for (const auto& [uuid, entry] : *entries) table.set(uuid, entry);
-    }
+    const Dictionary found = migrateComputersToControllers(*computers, read_fsnameservers(nullptr),
+                                                           globals.findArray("aliasControllers"));
+    log("foundControllers %@", Value(found));
+    for (const auto& [uuid, entry] : found) table.set(uuid, entry);
   }
 
   const std::string& ourUUID = getOurUUID();
@@ -196,7 +195,7 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
     flags |= kBuildPublish;
   }
 
-  const Value addressMap = calculateMachineIPMap(table);
+  const Dictionary addressMap = calculateMachineIPMap(table);
   Value nameServers(read_fsnameservers(&addressMap));
   const Value* publishedNameServers = globals.find("fsnameservers");
   if (!publishedNameServers || !(*publishedNameServers == nameServers)) {

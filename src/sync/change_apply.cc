@@ -5,8 +5,10 @@
 #include "kolt/error.h"
 #include "kolt/local_config.h"
 #include "kolt/log.h"
-#include "volumes/name_servers.h"
-#include "volumes/value_files.h"
+#include "volumes/controller_host_map.h"
+#include "volumes/key_operations.h"
+#include "volumes/nameservers.h"
+#include "volumes/querix_flags.h"
 #include "volumes/volume_update.h"
 
 namespace kolt {
@@ -41,7 +43,7 @@ void trustControllers(const Value& globals) {
 // logged in with it, and removing it would lock this machine out.
 void storeSecret(const Value& working) {
   if (working.findString("sharedSecret") == nullptr) return;
-  update_from_config(working, ".auth_secret", "sharedSecret", 0600);
+  update_from_config(*working.asDictionary(), ".auth_secret", "sharedSecret", 0600);
 }
 
 }  // namespace
@@ -63,13 +65,15 @@ int applyConfiguration(const ApplyContext& c) {
   bool certificatesChanged = false;
   if (!globalsIsWorking) {
     std::uint8_t changed = 0;
-    for (const char* key : kCopiedKeys) copyValue(working, globals, key, &changed);
+    Dictionary* destination = working.asDictionary();
+    const Dictionary& source = *globals.asDictionary();
+    for (const char* key : kCopiedKeys) copyValue(destination, source, key, &changed);
     changed = 0;
-    copyValue(working, globals, "certSetRevision", &changed);
+    copyValue(destination, source, "certSetRevision", &changed);
     certificatesChanged = (changed & 1) != 0;
   }
 
-  update_from_config(globals, "fsports", "fsports", 0644);
+  update_from_config(*globals.asDictionary(), "fsports", "fsports", 0644);
 
   if (working.find("configIsNew") != nullptr) {
     storeSecret(working);
@@ -84,9 +88,9 @@ int applyConfiguration(const ApplyContext& c) {
   const int workingFlags = querixServerFlagsForConfig(&working, &workingHash);
   if (loadedFlags != workingFlags || loadedHash != workingHash) mask |= kChangeQuerixServer;
 
-  Value ipMap = Value::dictionary();
+  Dictionary ipMap;
   if (const Dictionary* controllers = globals.findDictionary("controllers")) {
-    for (const auto& [uuid, entry] : *controllers) addControllerToIPMap(entry, ipMap);
+    for (const auto& [uuid, entry] : *controllers) addControllerToIPMap(entry, &ipMap);
   }
   working.set("controllerIPMap", std::move(ipMap));
 

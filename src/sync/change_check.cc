@@ -11,7 +11,8 @@
 #include "kolt/local_config.h"
 #include "kolt/log.h"
 #include "sync/change_apply.h"
-#include "volumes/value_files.h"
+#include "kolt/volume_files.h"
+#include "volumes/key_operations.h"
 
 namespace kolt {
 namespace {
@@ -118,11 +119,11 @@ int checkSanConfigChangeWithServer(const std::string* server, std::uint32_t* cha
 
   bool actsAsController = loaded && configPlistIsController(*loaded);
   if (newConfig != nullptr) {
-    static const Value kNothing;
-    const Value& source = loaded ? *loaded : kNothing;
+    const Dictionary nothing;
+    const Dictionary& source = loaded ? *loaded->asDictionary() : nothing;
     std::uint8_t ignored = 0;
     for (const char* key : {"vornAddr", "migratedVersion", "notifications"}) {
-      copyValue(*newConfig, source, key, &ignored);
+      copyValue(newConfig->asDictionary(), source, key, &ignored);
     }
     if (configPlistIsController(*newConfig)) actsAsController = true;
   }

@@ -72,8 +72,10 @@ bool validUTF8(std::string_view s) {
 // Step 1: the volume files of hosted volumes, with their dates.
 FoundTable scanVolumeFiles(Env& env) {
   FoundTable table;
-  std::vector<std::string> hostedList = getHostedVolumeList();
-  const std::set<std::string> hosted(hostedList.begin(), hostedList.end());
+  std::set<std::string> hosted;
+  for (const Value& name : getHostedVolumeList()) {
+    if (const std::string* s = name.asString()) hosted.insert(*s);
+  }
   std::string directory;
   int rc = env.resolvePath(kVornDirectory, &directory);
   std::vector<DirectoryEntry> entries;
