@@ -61,6 +61,55 @@ std::size_t xmlCharLength(const unsigned char* p, std::size_t left) {
   return 0;
 }
 
+std::size_t decimalDigits(std::uint64_t v) {
+  std::size_t n = 1;
+  while (v >= 10) {
+    v /= 10;
+    ++n;
+  }
+  return n;
+}
+
+// The size of the XML for `v` when no character needs escaping (reals and
+// dates counted at their longest), so the output is allocated once.
+std::size_t estimatedSize(const Value& v, std::size_t depth) {
+  switch (v.type()) {
+    case Value::Type::kDictionary: {
+      std::size_t n = depth * 2 + 16;
+      for (const auto& [key, value] : *v.asDictionary()) {
+        n += depth + 1 + 12 + key.size() + estimatedSize(value, depth + 1);
+      }
+      return n;
+    }
+    case Value::Type::kArray: {
+      std::size_t n = depth * 2 + 18;
+      for (const Value& item : *v.asArray()) n += estimatedSize(item, depth + 1);
+      return n;
+    }
+    case Value::Type::kString:
+      return depth + 18 + v.asString()->size();
+    case Value::Type::kInteger: {
+      const Integer& i = *v.asInteger();
+      const std::uint64_t magnitude = i.isUnsigned || i.bits >= 0
+                                          ? static_cast<std::uint64_t>(i.bits)
+                                          : 0 - static_cast<std::uint64_t>(i.bits);
+      return depth + 20 + decimalDigits(magnitude) + (i.bits < 0 && !i.isUnsigned);
+    }
+    case Value::Type::kReal:
+      return depth + 14 + 24;
+    case Value::Type::kBoolean:
+      return depth + 9;
+    case Value::Type::kDate:
+      return depth + 14 + 32;
+    case Value::Type::kData: {
+      const std::size_t chars = (v.asData()->bytes.size() + 2) / 3 * 4;
+      const std::size_t lines = (chars + base64::kLineChars - 1) / base64::kLineChars;
+      return depth * 2 + 16 + chars + lines * (depth + 1);
+    }
+  }
+  return 0;
+}
+
 class XmlWriter {
  public:
   explicit XmlWriter(std::string& out) : out_(out) {}
@@ -201,7 +250,7 @@ bool XmlWriter::write(const Value& v, std::size_t depth) {
 
 std::optional<std::string> writeXmlPropertyList(const Value& value, std::optional<Error>* error) {
   std::string out;
-  out.reserve(4096);
+  out.reserve(64 + estimatedSize(value, 0));
   out +=
       "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
       "<plist version=\"1.0\">\n";
