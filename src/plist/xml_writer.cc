@@ -5,6 +5,7 @@
 #include <array>
 #include <cmath>
 #include <cstdint>
+#include <cstring>
 
 #include "kolt/error.h"
 #include "kolt/plist.h"
@@ -61,55 +62,6 @@ std::size_t xmlCharLength(const unsigned char* p, std::size_t left) {
   return 0;
 }
 
-std::size_t decimalDigits(std::uint64_t v) {
-  std::size_t n = 1;
-  while (v >= 10) {
-    v /= 10;
-    ++n;
-  }
-  return n;
-}
-
-// The size of the XML for `v` when no character needs escaping (reals and
-// dates counted at their longest), so the output is allocated once.
-std::size_t estimatedSize(const Value& v, std::size_t depth) {
-  switch (v.type()) {
-    case Value::Type::kDictionary: {
-      std::size_t n = depth * 2 + 16;
-      for (const auto& [key, value] : *v.asDictionary()) {
-        n += depth + 1 + 12 + key.size() + estimatedSize(value, depth + 1);
-      }
-      return n;
-    }
-    case Value::Type::kArray: {
-      std::size_t n = depth * 2 + 18;
-      for (const Value& item : *v.asArray()) n += estimatedSize(item, depth + 1);
-      return n;
-    }
-    case Value::Type::kString:
-      return depth + 18 + v.asString()->size();
-    case Value::Type::kInteger: {
-      const Integer& i = *v.asInteger();
-      const std::uint64_t magnitude = i.isUnsigned || i.bits >= 0
-                                          ? static_cast<std::uint64_t>(i.bits)
-                                          : 0 - static_cast<std::uint64_t>(i.bits);
-      return depth + 20 + decimalDigits(magnitude) + (i.bits < 0 && !i.isUnsigned);
-    }
-    case Value::Type::kReal:
-      return depth + 14 + 24;
-    case Value::Type::kBoolean:
-      return depth + 9;
-    case Value::Type::kDate:
-      return depth + 14 + 32;
-    case Value::Type::kData: {
-      const std::size_t chars = (v.asData()->bytes.size() + 2) / 3 * 4;
-      const std::size_t lines = (chars + base64::kLineChars - 1) / base64::kLineChars;
-      return depth * 2 + 16 + chars + lines * (depth + 1);
-    }
-  }
-  return 0;
-}
-
 class XmlWriter {
  public:
   explicit XmlWriter(std::string& out) : out_(out) {}
@@ -127,12 +79,31 @@ class XmlWriter {
   std::string failure_;
 };
 
+// Whether any of the eight bytes in `w` is a control character, non-ASCII,
+// or one of & < > (bit tricks for "has a byte less than / equal to").
+bool wordNeedsCare(std::uint64_t w) {
+  constexpr std::uint64_t kOnes = 0x0101010101010101ull;
+  constexpr std::uint64_t kHigh = 0x8080808080808080ull;
+  auto hasZero = [](std::uint64_t x) { return (x - kOnes) & ~x & kHigh; };
+  const std::uint64_t below20 = (w - kOnes * 0x20) & ~w & kHigh;
+  return (below20 | (w & kHigh) | hasZero(w ^ (kOnes * '&')) | hasZero(w ^ (kOnes * '<')) |
+          hasZero(w ^ (kOnes * '>'))) != 0;
+}
+
 bool XmlWriter::text(std::string_view s, const char* what) {
   const auto* p = reinterpret_cast<const unsigned char*>(s.data());
   const std::size_t n = s.size();
   std::size_t run = 0;  // start of the bytes not yet copied
   std::size_t i = 0;
   while (i < n) {
+    if (i + 8 <= n) {
+      std::uint64_t w;
+      std::memcpy(&w, p + i, 8);
+      if (!wordNeedsCare(w)) {
+        i += 8;
+        continue;
+      }
+    }
     const std::uint8_t cls = kClasses[p[i]];
     if (cls == kPlain) {
       ++i;
@@ -250,7 +221,7 @@ bool XmlWriter::write(const Value& v, std::size_t depth) {
 
 std::optional<std::string> writeXmlPropertyList(const Value& value, std::optional<Error>* error) {
   std::string out;
-  out.reserve(64 + estimatedSize(value, 0));
+  out.reserve(4096);  // growing is cheaper than walking the tree twice
   out +=
       "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
       "<plist version=\"1.0\">\n";

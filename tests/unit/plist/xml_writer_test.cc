@@ -113,6 +113,16 @@ TEST(XmlWriterTest, EscapesMarkupAndCarriageReturns) {
   std::optional<Value> back = parsePropertyList(xml);
   ASSERT_TRUE(back);
   EXPECT_EQ(*back, doc);
+  // Markup after long plain runs, at every alignment.
+  for (std::size_t lead = 0; lead < 17; ++lead) {
+    const std::string text = std::string(lead, 'x') + "<&>\r" + std::string(lead, 'y') + "&";
+    const std::string out = write(Value(text));
+    EXPECT_NE(out.find("<string>" + std::string(lead, 'x') + "&lt;&amp;&gt;&#13;" +
+                       std::string(lead, 'y') + "&amp;</string>"),
+              std::string::npos)
+        << out;
+    EXPECT_EQ(*parsePropertyList(out)->asString(), text);
+  }
 }
 
 TEST(XmlWriterTest, RefusesWhatXmlCannotCarry) {
@@ -131,7 +141,15 @@ TEST(XmlWriterTest, RefusesWhatXmlCannotCarry) {
       "\xF4\x90\x80\x80",      // above U+10FFFF
       "\xF8\x88\x80\x80\x80",  // five bytes
   };
+  // Each alone, and after and between runs of plain text (the writer
+  // skips plain text a word at a time).
+  std::vector<std::string> cases;
   for (const std::string& s : bad) {
+    cases.push_back(s);
+    cases.push_back(std::string(13, 'p') + s);
+    cases.push_back(std::string(16, 'p') + s + std::string(9, 'q'));
+  }
+  for (const std::string& s : cases) {
     const std::string asString = writeFailure(Value(s));
     EXPECT_NE(asString.find("a string"), std::string::npos) << hex(s) << ": " << asString;
     Value dict = Value::dictionary();
