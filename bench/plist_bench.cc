@@ -95,15 +95,6 @@ Value localDocument() {
   doc.set("migratedVersion", Value::integer(2));
   doc.set("enableQuerixServer", Value::boolean(false));
   doc.set("querixServerVolumeList", strings({"Projects", "Archive", "Scratch"}));
-  Value computers = Value::array();
-  for (int i = 0; i < 3; ++i) {
-    Value c = Value::dictionary();
-    c.set("uuid", r.uuid());
-    c.set("ipAddresses", strings({r.address(), r.address()}));
-    c.set("legacyHostName", "member" + std::to_string(i + 1));
-    computers.asArray()->push_back(c);
-  }
-  doc.set("computers", computers);
   return doc;
 }
 
