@@ -197,9 +197,9 @@ bool XmlWriter::write(const Value& v, std::size_t depth) {
       return true;
     case Value::Type::kDate: {
       const double s = v.asDate()->seconds;
-      // The calendar holds about +-2.9e11 years; beyond that (or NaN) the
-      // text would name another date.
-      if (!std::isfinite(s) || std::fabs(s) >= 9.0e18) {
+      // Beyond the calendar's range (or NaN) the text would name another
+      // date, or one the reader refuses.
+      if (!std::isfinite(s) || std::fabs(s) >= calendar::kMaxIso8601Seconds) {
         failure_ = "a date lies outside the range XML dates can express";
         return false;
       }

@@ -166,6 +166,7 @@ TEST(XmlWriterTest, RefusesWhatXmlCannotCarry) {
   EXPECT_NE(writeFailure(Value::date(NAN)).find("date"), std::string::npos);
   EXPECT_NE(writeFailure(Value::date(INFINITY)).find("date"), std::string::npos);
   EXPECT_NE(writeFailure(Value::date(1e300)).find("date"), std::string::npos);
+  EXPECT_NE(writeFailure(Value::date(-8.0e18)).find("date"), std::string::npos);
 }
 
 TEST(XmlWriterTest, AcceptsTheWholeCharacterRange) {
@@ -190,7 +191,9 @@ TEST(XmlWriterTest, SampleRoundTripsExactly) {
 }
 
 TEST(XmlWriterTest, DatesRoundTripAtWholeSeconds) {
-  for (double s : {-3187296000.0, 3124137599.0, 0.0, -1.0, 1e10, -6.0e10, 123456789.75}) {
+  // 1900, 2100, year 1 BC and both ends of the range the writer accepts.
+  for (double s : {-3187296000.0, 3124137599.0, 0.0, -1.0, 1e10, -63200000000.0, 123456789.75,
+                   7.99e18, -7.99e18}) {
     std::optional<Value> back = parsePropertyList(write(Value::date(s)));
     ASSERT_TRUE(back) << s;
     EXPECT_EQ(back->asDate()->seconds, std::floor(s)) << s;
