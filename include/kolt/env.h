@@ -79,8 +79,9 @@ struct ProcessSpec {
 // The outcome of a started process.
 struct ProcessResult {
   pid_t pid = -1;
-  int exitStatus = -1;     // when waited for: exit code, or 128 + signal
-  std::string output;      // standard output, when it was a pipe and waited for
+  int exitStatus = -1;      // when waited for: exit code, or 128 + signal
+  std::string output;       // standard output, when it was a pipe and waited for
+  std::string errorOutput;  // standard error, when it was a pipe and waited for
 };
 
 // One address of a network interface.
@@ -120,7 +121,13 @@ class KOLT_EXPORT Env {
 
   // --- Processes ---------------------------------------------------------------
   // Starts the process; when `wait`, waits for its end and collects its exit
-  // status and piped output. Returns 0 or an errno value (the start failed).
+  // status and piped output (input and both outputs are served together, so
+  // no size deadlocks). Returns 0 or an errno value: the start failed, an exec
+  // failure included. The child gets the caller's environment plus
+  // KOLT_ROOT=<root> and no descriptor but its three standard streams.
+  // Without `wait` the child is detached (it never becomes the caller's
+  // zombie), `result->pid` names it, piped output goes to the null device and
+  // piped input must fit in a pipe (E2BIG otherwise).
   virtual int runProcess(const ProcessSpec& spec, bool wait, ProcessResult* result) = 0;
 
   // --- Host and process identity -----------------------------------------------

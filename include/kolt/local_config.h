@@ -26,7 +26,8 @@ KOLT_EXPORT std::optional<Value> loadConfigPlist();
 
 // Writes `document` whole, as an XML property list (format 1.0), atomically
 // and durably: a reader sees the old document or the new one, never a torn,
-// empty or missing file. Returns false when it was not written; the old file
+// empty or missing file. The file gets mode 0644, or 0600 when the document
+// holds "sharedSecret". Returns false when it was not written; the old file
 // then stays in place.
 KOLT_EXPORT bool saveConfigPlist(const Value& document);
 

@@ -30,7 +30,11 @@ std::optional<Value> loadConfigPlist() {
 bool saveConfigPlist(const Value& document) {
   std::optional<std::string> xml = writeXmlPropertyList(document);
   if (!xml) return false;
-  return writeFileAtomically(currentEnv(), kConfigPlistPath, *xml, 0644) == 0;
+  // A document that carries the shared secret is readable by its owner only.
+  const mode_t mode = document.find("sharedSecret") != nullptr ? 0600 : 0644;
+  // The atomic writer syncs the file and its directory: the new document is
+  // durable once this returns true.
+  return writeFileAtomically(currentEnv(), kConfigPlistPath, *xml, mode) == 0;
 }
 
 bool configPlistIsController(const Value& document) {
@@ -38,7 +42,9 @@ bool configPlistIsController(const Value& document) {
   return role != nullptr && *role == "CONTROLLER";
 }
 
-bool configPlistIsMaster(const Value&) { return false; }
+bool configPlistIsMaster(const Value&) {
+  return false;
+}
 
 bool configPlistIsZombie(const Value& document) {
   const Value* needsActivation = document.find("needsActivation");
@@ -48,10 +54,13 @@ bool configPlistIsZombie(const Value& document) {
   return ::strcasecmp(primaryZombie->c_str(), getOurUUID().c_str()) == 0;
 }
 
-void fillInOurUUID() {
-  Env& env = currentEnv();
+namespace {
+
+void fillInOurUUIDFor(Env& env) {
+  // Threads racing here ask the platform once; the others wait for the fill.
   std::call_once(env.hostUUIDOnce(), [&env] {
-    // A platform that cannot tell leaves the bytes cleared: the zero UUID.
+    // A platform that cannot tell gives the zero UUID, never stale or
+    // uninitialised bytes.
     std::array<std::uint8_t, 16> bytes{};
     const int rc = env.hardwareUUID(&bytes);
     if (rc != 0) {
@@ -67,9 +76,17 @@ void fillInOurUUID() {
   });
 }
 
+}  // namespace
+
+void fillInOurUUID() {
+  fillInOurUUIDFor(currentEnv());
+}
+
 const std::string& getOurUUID() {
-  fillInOurUUID();
-  return currentEnv().hostUUIDCache();
+  // One Env for the fill and the answer, even if the current Env changes.
+  Env& env = currentEnv();
+  fillInOurUUIDFor(env);
+  return env.hostUUIDCache();
 }
 
 }  // namespace kolt

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cstdio>
+#include <cstdlib>
 #include <mutex>
 #include <string>
 
@@ -27,7 +28,9 @@ Sink& sink() {
   return *s;
 }
 
-bool isFlag(char c) { return c == '-' || c == '+' || c == ' ' || c == '#' || c == '0'; }
+bool isFlag(char c) {
+  return c == '-' || c == '+' || c == ' ' || c == '#' || c == '0';
+}
 bool isLengthModifier(char c) {
   return c == 'h' || c == 'l' || c == 'q' || c == 'L' || c == 'j' || c == 'z' || c == 't';
 }
@@ -43,7 +46,8 @@ std::string convert(const std::string& spec, char conv, const FormatArg& arg) {
     case 'd':
     case 'i':
       if (arg.kind() == Kind::kSigned) {
-        n = std::snprintf(buf, sizeof buf, (f + "lld").c_str(), static_cast<long long>(arg.signedValue()));
+        n = std::snprintf(buf, sizeof buf, (f + "lld").c_str(),
+                          static_cast<long long>(arg.signedValue()));
       } else if (arg.kind() == Kind::kUnsigned) {
         n = std::snprintf(buf, sizeof buf, (f + "lld").c_str(),
                           static_cast<long long>(arg.unsignedValue()));
@@ -61,8 +65,11 @@ std::string convert(const std::string& spec, char conv, const FormatArg& arg) {
       }
       break;
     case 'c':
-      if (arg.kind() == Kind::kSigned || arg.kind() == Kind::kUnsigned) {
+      if (arg.kind() == Kind::kSigned) {
         n = std::snprintf(buf, sizeof buf, (f + "c").c_str(), static_cast<int>(arg.signedValue()));
+      } else if (arg.kind() == Kind::kUnsigned) {
+        n = std::snprintf(buf, sizeof buf, (f + "c").c_str(),
+                          static_cast<int>(arg.unsignedValue()));
       }
       break;
     case 'f':
@@ -76,7 +83,11 @@ std::string convert(const std::string& spec, char conv, const FormatArg& arg) {
       if (arg.kind() == Kind::kReal) {
         n = std::snprintf(buf, sizeof buf, (f + conv).c_str(), arg.realValue());
       } else if (arg.kind() == Kind::kSigned) {
-        n = std::snprintf(buf, sizeof buf, (f + conv).c_str(), static_cast<double>(arg.signedValue()));
+        n = std::snprintf(buf, sizeof buf, (f + conv).c_str(),
+                          static_cast<double>(arg.signedValue()));
+      } else if (arg.kind() == Kind::kUnsigned) {
+        n = std::snprintf(buf, sizeof buf, (f + conv).c_str(),
+                          static_cast<double>(arg.unsignedValue()));
       }
       break;
     case 's':
@@ -94,7 +105,8 @@ std::string convert(const std::string& spec, char conv, const FormatArg& arg) {
     default:
       break;
   }
-  if (n >= 0 && static_cast<std::size_t>(n) < sizeof buf) return std::string(buf, static_cast<std::size_t>(n));
+  if (n >= 0 && static_cast<std::size_t>(n) < sizeof buf)
+    return std::string(buf, static_cast<std::size_t>(n));
   return arg.describe();
 }
 
@@ -114,8 +126,16 @@ std::string FormatArg::describe() const {
       return std::to_string(signed_);
     case Kind::kUnsigned:
       return std::to_string(unsigned_);
-    case Kind::kReal:
-      return std::to_string(real_);
+    case Kind::kReal: {
+      // The shortest text that reads back as the same number ("1.5", not
+      // "1.500000").
+      char buf[40];
+      for (int precision = 1; precision <= 17; ++precision) {
+        std::snprintf(buf, sizeof buf, "%.*g", precision, real_);
+        if (std::strtod(buf, nullptr) == real_) break;
+      }
+      return buf;
+    }
   }
   return "(null)";
 }

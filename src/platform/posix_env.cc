@@ -5,7 +5,6 @@
 #include <netinet/in.h>
 #include <signal.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <time.h>
 #include <unistd.h>
 #include <uuid/uuid.h>
@@ -16,9 +15,12 @@
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
+#include <string_view>
+#include <vector>
 
 #include "kolt/env.h"
 #include "platform/directory/ldap_directory.h"
+#include "platform/posix_process.h"
 #include "plist/calendar.h"
 
 extern char** environ;
@@ -90,32 +92,85 @@ bool parseHexUUID(std::string_view text, std::array<std::uint8_t, 16>* out) {
   return true;
 }
 
+// Maps a system path below `root`. "." and ".." are resolved by name and
+// never climb above the root, so no path (a volume name "../../x" included)
+// names a file outside it. A relative path counts from the root.
+std::string mapBelowRoot(const std::string& root, std::string_view path) {
+  std::vector<std::string_view> parts;
+  std::size_t start = 0;
+  while (start <= path.size()) {
+    std::size_t end = path.find('/', start);
+    if (end == std::string_view::npos) end = path.size();
+    const std::string_view part = path.substr(start, end - start);
+    if (part == "..") {
+      if (!parts.empty()) parts.pop_back();
+    } else if (!part.empty() && part != ".") {
+      parts.push_back(part);
+    }
+    start = end + 1;
+  }
+  std::string out = root == "/" ? std::string() : root;
+  for (const std::string_view part : parts) {
+    out += '/';
+    out += part;
+  }
+  if (parts.empty()) return root;
+  // A trailing slash keeps its meaning ("this must be a directory").
+  if (path.back() == '/') out += '/';
+  return out;
+}
+
+// True when the path can be handed to the system: an embedded NUL would
+// silently name a shorter path.
+bool usablePath(const std::string& path) {
+  return path.find('\0') == std::string::npos;
+}
+
+bool isPidText(const std::string& text, long* pid) {
+  std::size_t end = text.find_last_not_of(" \t\r\n");
+  if (end == std::string::npos) return false;
+  const std::string digits = text.substr(0, end + 1);
+  if (digits.empty() || digits.size() > 10) return false;
+  for (char c : digits) {
+    if (c < '0' || c > '9') return false;
+  }
+  *pid = std::strtol(digits.c_str(), nullptr, 10);
+  return true;
+}
+
 class PosixEnv final : public Env {
  public:
   explicit PosixEnv(std::string root) : root_(normaliseRoot(std::move(root))) {}
 
-  std::string hostPath(const std::string& path) const override {
-    if (root_ == "/") return path;
-    if (!path.empty() && path[0] == '/') return root_ + path;
-    return root_ + "/" + path;
-  }
+  std::string hostPath(const std::string& path) const override { return mapBelowRoot(root_, path); }
 
   int readFile(const std::string& path, std::string* contents) override {
-    const int fd = ::open(hostPath(path).c_str(), O_RDONLY | O_CLOEXEC);
+    if (!usablePath(path)) return EINVAL;
+    // Non-blocking open: a FIFO planted at a document's path must not hang us.
+    const int fd = ::open(hostPath(path).c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
     if (fd < 0) return errno;
-    contents->clear();
-    const int rc = readAll(fd, contents);
+    struct stat st;
+    int rc = ::fstat(fd, &st) != 0 ? errno : 0;
+    if (rc == 0 && S_ISDIR(st.st_mode)) rc = EISDIR;
+    if (rc == 0 && !S_ISREG(st.st_mode)) rc = EINVAL;
+    if (rc == 0) {
+      contents->clear();
+      rc = readAll(fd, contents);
+    }
     ::close(fd);
     return rc;
   }
 
   int newWritableFile(const std::string& path, mode_t mode, bool exclusive,
                       std::unique_ptr<WritableFile>* file) override {
-    const int flags = O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | (exclusive ? O_EXCL : 0);
+    if (!usablePath(path)) return EINVAL;
+    const int flags =
+        O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOCTTY | (exclusive ? O_EXCL : 0);
     const int fd = ::open(hostPath(path).c_str(), flags, mode & 07777);
     if (fd < 0) return errno;
     // The umask may have narrowed the mode; set it exactly before any byte
-    // is written, so a secret is never readable by others.
+    // is written. It only ever narrows, so a secret is never readable by
+    // others, not even for a moment.
     if (::fchmod(fd, mode & 07777) != 0) {
       const int e = errno;
       ::close(fd);
@@ -126,14 +181,17 @@ class PosixEnv final : public Env {
   }
 
   int renameFile(const std::string& from, const std::string& to) override {
+    if (!usablePath(from) || !usablePath(to)) return EINVAL;
     return ::rename(hostPath(from).c_str(), hostPath(to).c_str()) == 0 ? 0 : errno;
   }
 
   int removeFile(const std::string& path) override {
+    if (!usablePath(path)) return EINVAL;
     return ::unlink(hostPath(path).c_str()) == 0 ? 0 : errno;
   }
 
   int syncDirectory(const std::string& path) override {
+    if (!usablePath(path)) return EINVAL;
     const int fd = ::open(hostPath(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     if (fd < 0) return errno;
     const int rc = ::fsync(fd) == 0 ? 0 : errno;
@@ -142,6 +200,7 @@ class PosixEnv final : public Env {
   }
 
   int fileInfo(const std::string& path, FileInfo* info) override {
+    if (!usablePath(path)) return EINVAL;
     struct stat st;
     if (::stat(hostPath(path).c_str(), &st) != 0) return errno;
     info->isDirectory = S_ISDIR(st.st_mode);
@@ -153,9 +212,16 @@ class PosixEnv final : public Env {
 
   int listDirectory(const std::string& path, std::vector<DirectoryEntry>* entries) override {
     entries->clear();
-    const std::string dirPath = hostPath(path);
-    DIR* dir = ::opendir(dirPath.c_str());
-    if (dir == nullptr) return errno;
+    if (!usablePath(path)) return EINVAL;
+    const int dirFd =
+        ::open(hostPath(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | O_NONBLOCK);
+    if (dirFd < 0) return errno;
+    DIR* dir = ::fdopendir(dirFd);
+    if (dir == nullptr) {
+      const int e = errno;
+      ::close(dirFd);
+      return e;
+    }
     int rc = 0;
     for (;;) {
       errno = 0;
@@ -166,17 +232,24 @@ class PosixEnv final : public Env {
       }
       if (std::strcmp(d->d_name, ".") == 0 || std::strcmp(d->d_name, "..") == 0) continue;
       struct stat st;
-      if (::fstatat(::dirfd(dir), d->d_name, &st, 0) != 0) {
+      // A dangling link lists with its own date; an entry removed meanwhile
+      // is simply no longer there. Neither spoils the rest of the listing.
+      if (::fstatat(dirFd, d->d_name, &st, 0) != 0 &&
+          ::fstatat(dirFd, d->d_name, &st, AT_SYMLINK_NOFOLLOW) != 0) {
+        if (errno == ENOENT) continue;
         rc = errno;
         break;
       }
       entries->push_back({d->d_name, timespecTo2001(st.st_mtim), S_ISDIR(st.st_mode)});
     }
     ::closedir(dir);
+    if (rc != 0) entries->clear();
     return rc;
   }
 
   int setModificationTime(const std::string& path, double secondsSince2001) override {
+    if (!usablePath(path)) return EINVAL;
+    if (!std::isfinite(secondsSince2001)) return EINVAL;
     const double unixTime = secondsSince2001 + static_cast<double>(calendar::kUnixEpochTo2001);
     const double whole = std::floor(unixTime);
     struct timespec times[2];
@@ -192,21 +265,27 @@ class PosixEnv final : public Env {
   }
 
   int setPermissions(const std::string& path, mode_t mode) override {
+    if (!usablePath(path)) return EINVAL;
     return ::chmod(hostPath(path).c_str(), mode & 07777) == 0 ? 0 : errno;
   }
 
   int createDirectories(const std::string& path, mode_t mode) override {
+    if (!usablePath(path)) return EINVAL;
     const std::string full = hostPath(path);
-    std::string partial;
-    std::size_t pos = 0;
-    while (pos <= full.size()) {
+    std::size_t pos = 1;
+    for (;;) {
       const std::size_t slash = full.find('/', pos);
-      const std::size_t end = slash == std::string::npos ? full.size() : slash;
-      partial = full.substr(0, end);
-      pos = end + 1;
-      if (partial.empty()) continue;
-      if (::mkdir(partial.c_str(), mode) != 0 && errno != EEXIST) return errno;
-      if (slash == std::string::npos) break;
+      const std::string partial = full.substr(0, slash);
+      if (!partial.empty() && partial != "/") {
+        if (::mkdir(partial.c_str(), mode & 07777) == 0) {
+          // Exactly the mode asked for, whatever the umask.
+          if (::chmod(partial.c_str(), mode & 07777) != 0) return errno;
+        } else if (errno != EEXIST) {
+          return errno;
+        }
+      }
+      if (slash == std::string::npos || slash + 1 >= full.size()) break;
+      pos = slash + 1;
     }
     struct stat st;
     if (::stat(full.c_str(), &st) != 0) return errno;
@@ -214,9 +293,10 @@ class PosixEnv final : public Env {
   }
 
   int resolvePath(const std::string& path, std::string* resolved) override {
+    if (!usablePath(path)) return EINVAL;
     char buf[PATH_MAX];
     if (::realpath(hostPath(path).c_str(), buf) == nullptr) return errno;
-    std::string host(buf);
+    const std::string host(buf);
     if (root_ == "/") {
       *resolved = host;
       return 0;
@@ -231,17 +311,35 @@ class PosixEnv final : public Env {
     } else {
       return EXDEV;  // the link leads out of the root
     }
-    if (!path.empty() && path.back() == '/' && resolved->back() != '/') *resolved += '/';
     return 0;
   }
 
   int runProcess(const ProcessSpec& spec, bool wait, ProcessResult* result) override {
-    return startChild(spec, wait, result);
+    if (!usablePath(spec.executable)) return EINVAL;
+    posix::HostProcess process;
+    process.executable = hostPath(spec.executable);
+    // argv[0] is the system path, as the program would see it on its machine.
+    process.arguments.push_back(spec.executable);
+    for (const std::string& a : spec.arguments) {
+      if (a.find('\0') != std::string::npos) return EINVAL;
+      process.arguments.push_back(a);
+    }
+    // Children learn the root, so stand-in tools can map system paths too.
+    for (char** e = environ; e != nullptr && *e != nullptr; ++e) {
+      if (std::strncmp(*e, "KOLT_ROOT=", 10) != 0) process.environment.emplace_back(*e);
+    }
+    process.environment.push_back("KOLT_ROOT=" + root_);
+    process.standardInput = spec.standardInput;
+    process.input = spec.input;
+    process.standardOutput = hostStream(spec.standardOutput);
+    process.standardError = hostStream(spec.standardError);
+    return posix::startProcess(process, wait, result);
   }
 
   int hardwareUUID(std::array<std::uint8_t, 16>* uuid) override {
     std::string text;
-    if (readFile("/sys/class/dmi/id/product_uuid", &text) == 0 && parseHexUUID(text, uuid)) return 0;
+    if (readFile("/sys/class/dmi/id/product_uuid", &text) == 0 && parseHexUUID(text, uuid))
+      return 0;
     if (readFile("/etc/machine-id", &text) == 0 && parseHexUUID(text, uuid)) return 0;
     return ENOENT;
   }
@@ -304,7 +402,7 @@ class PosixEnv final : public Env {
   }
 
   void sleepSeconds(double seconds) override {
-    if (!(seconds > 0)) return;
+    if (!(seconds > 0) || !std::isfinite(seconds)) return;
     struct timespec ts;
     ts.tv_sec = static_cast<time_t>(seconds);
     ts.tv_nsec = static_cast<long>((seconds - static_cast<double>(ts.tv_sec)) * 1e9);
@@ -313,13 +411,18 @@ class PosixEnv final : public Env {
   }
 
   int signalJob(const std::string& label, int signal) override {
+    // A label names one file in /var/run, never a path.
+    if (label.empty() || label[0] == '.' || label.find('/') != std::string::npos ||
+        !usablePath(label)) {
+      return EINVAL;
+    }
     std::string text;
     const int rc = readFile("/var/run/" + label + ".pid", &text);
     if (rc != 0) return rc;
-    char* end = nullptr;
-    errno = 0;
-    const long pid = std::strtol(text.c_str(), &end, 10);
-    if (errno != 0 || end == text.c_str() || pid <= 1 || pid > INT_MAX) return ESRCH;
+    long pid = 0;
+    // Never 0, 1 or a negative number: those would signal a process group,
+    // init or every process.
+    if (!isPidText(text, &pid) || pid <= 1 || pid > INT_MAX) return ESRCH;
     return ::kill(static_cast<pid_t>(pid), signal) == 0 ? 0 : errno;
   }
 
@@ -335,136 +438,16 @@ class PosixEnv final : public Env {
     return root;
   }
 
-  // Opens the descriptor a child's stream uses; -1 for a pipe.
-  int openStream(const StreamSpec& s, bool forInput) {
+  StreamSpec hostStream(const StreamSpec& s) const {
+    StreamSpec mapped = s;
     if (s.kind == StreamSpec::Kind::kAppendToExistingFile) {
-      const int fd = ::open(hostPath(s.path).c_str(), O_WRONLY | O_APPEND | O_CLOEXEC);
-      if (fd >= 0) return fd;
-    }
-    if (s.kind == StreamSpec::Kind::kPipe) return -1;
-    return ::open("/dev/null", (forInput ? O_RDONLY : O_WRONLY) | O_CLOEXEC);
-  }
-
-  // Starts the child. A child that is not waited for is started through an
-  // intermediate process that exits at once, so it never lingers as a zombie
-  // of the caller.
-  int startChild(const ProcessSpec& spec, bool wait, ProcessResult* result) {
-    const std::string executable = hostPath(spec.executable);
-    std::vector<std::string> argStrings;
-    argStrings.push_back(spec.executable);
-    argStrings.insert(argStrings.end(), spec.arguments.begin(), spec.arguments.end());
-    std::vector<char*> argv;
-    for (auto& a : argStrings) argv.push_back(a.data());
-    argv.push_back(nullptr);
-    // Children learn the sandbox root, so stand-in tools can map system paths.
-    std::vector<std::string> envStrings;
-    for (char** e = environ; e && *e; ++e) {
-      if (std::strncmp(*e, "KOLT_ROOT=", 10) != 0) envStrings.emplace_back(*e);
-    }
-    envStrings.push_back("KOLT_ROOT=" + root_);
-    std::vector<char*> envp;
-    for (auto& e : envStrings) envp.push_back(e.data());
-    envp.push_back(nullptr);
-
-    int inFd = openStream(spec.standardInput, true);
-    int outFd = openStream(spec.standardOutput, false);
-    int errFd = openStream(spec.standardError, false);
-    int inPipe[2] = {-1, -1}, outPipe[2] = {-1, -1}, errPipe[2] = {-1, -1}, pidPipe[2] = {-1, -1};
-    auto closeAll = [&] {
-      for (int fd : {inFd, outFd, errFd, inPipe[0], inPipe[1], outPipe[0], outPipe[1], errPipe[0],
-                     errPipe[1], pidPipe[0], pidPipe[1]}) {
-        if (fd >= 0) ::close(fd);
+      if (usablePath(s.path)) {
+        mapped.path = hostPath(s.path);
+      } else {
+        mapped = StreamSpec::null();
       }
-    };
-    bool ok = true;
-    if (inFd < 0) ok = ok && ::pipe2(inPipe, O_CLOEXEC) == 0;
-    if (outFd < 0) ok = ok && ::pipe2(outPipe, O_CLOEXEC) == 0;
-    if (errFd < 0) ok = ok && ::pipe2(errPipe, O_CLOEXEC) == 0;
-    ok = ok && ::pipe2(pidPipe, O_CLOEXEC) == 0;
-    if (!ok) {
-      const int e = errno;
-      closeAll();
-      return e;
     }
-    const int childIn = inFd >= 0 ? inFd : inPipe[0];
-    const int childOut = outFd >= 0 ? outFd : outPipe[1];
-    const int childErr = errFd >= 0 ? errFd : errPipe[1];
-
-    const pid_t pid = ::fork();
-    if (pid < 0) {
-      const int e = errno;
-      closeAll();
-      return e;
-    }
-    if (pid == 0) {
-      // Only async-signal-safe calls from here on.
-      if (!wait) {
-        const pid_t grandchild = ::fork();
-        if (grandchild != 0) {
-          const int report = grandchild > 0 ? grandchild : -errno;
-          (void)!::write(pidPipe[1], &report, sizeof report);
-          ::_exit(0);
-        }
-      }
-      ::dup2(childIn, 0);
-      ::dup2(childOut, 1);
-      ::dup2(childErr, 2);
-      ::execve(executable.c_str(), argv.data(), envp.data());
-      const int report = -errno;
-      (void)!::write(pidPipe[1], &report, sizeof report);
-      ::_exit(127);
-    }
-    // Parent: keep only our ends.
-    for (int* fd : {&inFd, &outFd, &errFd, &inPipe[0], &outPipe[1], &errPipe[1], &pidPipe[1]}) {
-      if (*fd >= 0) ::close(*fd);
-      *fd = -1;
-    }
-    int startError = 0;
-    if (!wait) {
-      int report = 0;
-      ssize_t n;
-      do {
-        n = ::read(pidPipe[0], &report, sizeof report);
-      } while (n < 0 && errno == EINTR);
-      int status = 0;
-      while (::waitpid(pid, &status, 0) < 0 && errno == EINTR) {
-      }
-      if (n == sizeof report && report > 0) {
-        result->pid = report;
-      } else if (n == sizeof report && report < 0) {
-        startError = -report;
-      }
-      // An exec failure in the grandchild is reported through the same pipe.
-      int execReport = 0;
-      do {
-        n = ::read(pidPipe[0], &execReport, sizeof execReport);
-      } while (n < 0 && errno == EINTR);
-      if (n == sizeof execReport && execReport < 0) startError = -execReport;
-      closeAll();
-      return startError;
-    }
-    result->pid = pid;
-    if (inPipe[1] >= 0) {
-      (void)!::write(inPipe[1], spec.input.data(), spec.input.size());
-      ::close(inPipe[1]);
-      inPipe[1] = -1;
-    }
-    std::string output, errors;
-    if (outPipe[0] >= 0) readAll(outPipe[0], &output);
-    if (errPipe[0] >= 0) readAll(errPipe[0], &errors);
-    int status = 0;
-    while (::waitpid(pid, &status, 0) < 0 && errno == EINTR) {
-    }
-    int execReport = 0;
-    ssize_t n;
-    do {
-      n = ::read(pidPipe[0], &execReport, sizeof execReport);
-    } while (n < 0 && errno == EINTR);
-    closeAll();
-    if (n == sizeof execReport && execReport < 0) return -execReport;
-    result->output = std::move(output);
-    result->exitStatus = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-    return 0;
+    return mapped;
   }
 
   std::string root_;

@@ -1,4 +1,5 @@
 // Opening LDAP directory nodes ("/LDAPv3/<url or host>") for the PosixEnv.
+// The mapping of records to entries is in docs/directory.md.
 #ifndef KOLT_PLATFORM_DIRECTORY_LDAP_DIRECTORY_H
 #define KOLT_PLATFORM_DIRECTORY_LDAP_DIRECTORY_H
 
@@ -10,9 +11,11 @@
 
 namespace kolt {
 
-// Opens the node named `nodeName` over LDAP. ldapi socket paths are mapped
-// below `env`'s root. Null with `error` (directory domain) on failure.
-std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeName, ErrorSlot* error);
+// A node over LDAP (libldap). Opening only checks the name (-9 when it is
+// no node name); the first operation connects. ldapi socket paths and kolt's
+// trust store are mapped below `env`'s root; `env` must outlive the node.
+std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeName,
+                                            ErrorSlot* error);
 
 }  // namespace kolt
 

@@ -1,0 +1,83 @@
+// One LDAP session of a node: the libldap handle, its transport security,
+// its credentials and the search base. Shared by the node and its records.
+#ifndef KOLT_PLATFORM_DIRECTORY_LDAP_CONNECTION_H
+#define KOLT_PLATFORM_DIRECTORY_LDAP_CONNECTION_H
+
+#include <ldap.h>
+
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "kolt/directory.h"
+#include "kolt/env.h"
+#include "kolt/error.h"
+#include "platform/directory/node_address.h"
+
+namespace kolt {
+
+// Network time-outs: connecting, and waiting for any one operation.
+inline constexpr int kLdapConnectTimeoutSeconds = 10;
+inline constexpr int kLdapOperationTimeoutSeconds = 60;
+
+class LdapConnection {
+ public:
+  LdapConnection(Env& env, NodeAddress address);
+  ~LdapConnection();
+  LdapConnection(const LdapConnection&) = delete;
+  LdapConnection& operator=(const LdapConnection&) = delete;
+
+  // Every call below needs this held.
+  std::mutex& mutex() { return mutex_; }
+  Env& env() { return env_; }
+  const NodeAddress& address() const { return address_; }
+
+  // Connects when not connected (again after a lost connection), binds as
+  // the session's credentials (none, SASL EXTERNAL on ldapi, or the user
+  // set by setCredentials) and finds the search base.
+  std::optional<Error> ready();
+  LDAP* handle() { return ld_; }
+  const std::string& base() const { return base_; }
+
+  // Simple bind as the user record `name`; see DirectoryNode. A failure
+  // leaves the session anonymous.
+  std::optional<Error> setCredentials(const std::string& name, const std::string& password);
+
+  // The error for result code `rc` of the last operation, with the
+  // server's diagnostic message. A lost connection is dropped, so the next
+  // operation connects again.
+  Error error(int rc);
+
+  // The DN of a record, and the container of a record type.
+  std::string recordDn(RecordType type, const std::string& name) const;
+  std::string container(RecordType type) const;
+
+ private:
+  std::optional<Error> connect();
+  std::optional<Error> startTlsIfRequired();
+  std::optional<Error> readNamingContexts();
+  int simpleBind(const std::string& dn, const std::string& password);
+  void chooseBaseByProbing();
+  void drop();
+
+  std::mutex mutex_;
+  Env& env_;
+  NodeAddress address_;
+  LDAP* ld_ = nullptr;
+  bool tls_ = false;
+  std::vector<std::string> namingContexts_;
+  std::string base_;
+  bool baseConfirmed_ = false;
+  // The user the session is bound as, kept to bind again after a lost
+  // connection. Never logged, never put into an error.
+  std::optional<std::string> userName_;
+  std::string password_;
+  // False once credentials were set: a failed bind leaves the session
+  // anonymous, also on ldapi.
+  bool external_ = true;
+};
+
+}  // namespace kolt
+
+#endif  // KOLT_PLATFORM_DIRECTORY_LDAP_CONNECTION_H
