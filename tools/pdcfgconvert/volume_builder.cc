@@ -281,8 +281,9 @@ bool VolumeBuilder::checkNodes(ConversionError* error) {
     for (std::size_t i = 0; i < nodes.size(); ++i) {
       const std::string& disk = *nodes[i].findString("disk");
       const std::int64_t index = integerOf(*nodes[i].find("index"));
-      const std::string where = describe(nodeKey) + " " + quoteForMessage(disk) + " " +
-                                std::to_string(index) + " in " + describe(s);
+      // Names were checked when read, so they need no quoting.
+      const std::string where =
+          describe(nodeKey) + " " + disk + " " + std::to_string(index) + " in " + describe(s);
       if (!diskLines.contains(disk)) {
         return fail(error, lines[i], where + ": no disk of that name is defined");
       }
