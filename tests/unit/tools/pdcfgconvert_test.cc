@@ -401,6 +401,75 @@ const SourceCase kTextErrors[] = {
      5, "StripeBreadth 256K of [StripeGroup s] is not a multiple of the block size 1M"},
 };
 
+// kMinimalText with one more line in each section; `diskLine` replaces the
+// disk's Sectors when given.
+std::string minimalWith(const std::string& globalLine, const std::string& diskLine,
+                        const std::string& groupLine) {
+  return "[Global]\n" + globalLine + "\n[Disk d0]\n" +
+         (diskLine.empty() ? "Sectors 1000" : diskLine) +
+         "\n[StripeGroup all]\nMetadata yes\nJournal yes\nNode d0 0\n" + groupLine + "\n";
+}
+
+TEST_F(PdcfgconvertTest, ValuesAtTheirBoundaries) {
+  const struct {
+    std::string source;
+    bool accepted;
+  } cases[] = {
+      {minimalWith("", "Sectors 9223372036854775807", ""), true},
+      {minimalWith("", "Sectors 9223372036854775808", ""), false},
+      {minimalWith("", "Sectors 0", ""), false},
+      {minimalWith("JournalSize 64G", "", ""), true},
+      {minimalWith("JournalSize 65537M", "", ""), false},
+      {minimalWith("JournalSize 1048575", "", ""), false},
+      {minimalWith("JournalSize 1048576", "", ""), true},
+      {minimalWith("MaxConnections 65535", "", ""), true},
+      {minimalWith("MaxConnections 65536", "", ""), false},
+      {minimalWith("", "", "StripeBreadth 1G"), true},
+      {minimalWith("", "", "StripeBreadth 8388607T"), false},
+      {minimalWith("", "", "StripeBreadth 8388608T"), false},  // 2^63: overflows
+      {minimalWith("", "Sectors 1\nSectorSize 4096", ""), true},
+      {minimalWith("", "Sectors 1\nSectorSize 8192", ""), false},
+      {minimalWith("", "Sectors 1\nSectorSize 1000", ""), false},
+      {minimalWith("#" + std::string(4095, 'x'), "", ""), true},
+      {minimalWith("#" + std::string(4096, 'x'), "", ""), false},
+      {minimalWith("#" + std::string(4095, 'x') + "\r", "", ""), true},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.source.substr(0, 120));
+    writeVolumeFile("v.cfg", c.source);
+    const RunResult result = convert("v", "v.cfg");
+    if (c.accepted) {
+      EXPECT_EQ(result.exitStatus, 0) << result.err;
+    } else {
+      expectFailure(result, 1, {"v.cfg:"});
+    }
+  }
+  writeVolumeFile("v.cfg", minimalWith("JournalSize 64G", "Sectors 9223372036854775807", ""));
+  const Value volume = convertToValue("v", "v.cfg");
+  const Value* disks = volume.find("disks");
+  ASSERT_NE(disks, nullptr);
+  expectSameValue(*disks->find("d0"), disk(INT64_MAX, 512));
+  expectSameValue(*volume.find("global")->find("journalSize"), Value::integer(64LL << 30));
+}
+
+TEST_F(PdcfgconvertTest, FailureToWriteTheOutputIsReported) {
+  installSample("Scratch.cfg");
+  fs::create_directories(root_ / "dev");
+  fs::create_symlink("/dev/full", root_ / "dev/full");
+  std::ofstream(root_ / fs::path(kStderrPath).relative_path(), std::ios::trunc).flush();
+  ProcessSpec spec;
+  spec.executable = kToolPath;
+  spec.arguments = {"-n", "Scratch", std::string(kVolumeDirectory) + "Scratch.cfg"};
+  spec.standardOutput = StreamSpec::appendTo("/dev/full");
+  spec.standardError = StreamSpec::appendTo(kStderrPath);
+  ProcessResult process;
+  ASSERT_EQ(env_->runProcess(spec, /*wait=*/true, &process), 0);
+  EXPECT_EQ(process.exitStatus, 1);
+  EXPECT_NE(readHostFile(root_ / fs::path(kStderrPath).relative_path())
+                .find("cannot write to standard output"),
+            std::string::npos);
+}
+
 TEST_F(PdcfgconvertTest, TextSourceErrorsNameTheProblemAndTheLine) {
   for (const SourceCase& c : kTextErrors) {
     SCOPED_TRACE(c.source);
