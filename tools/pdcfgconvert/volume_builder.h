@@ -9,6 +9,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "conversion_error.h"
@@ -62,7 +63,8 @@ class VolumeBuilder {
   bool checkNodes(ConversionError* error);
 
   Syntax syntax_;
-  std::vector<Section> sections_;  // in source order
+  std::vector<Section> sections_;                                    // in source order
+  std::map<std::pair<SectionKind, std::string>, int> sectionLines_;  // kind and name -> line
 };
 
 }  // namespace pdcfgconvert

@@ -559,6 +559,14 @@ TEST_F(PdcfgconvertTest, HostileSourcesFailCleanly) {
   expectFailure(longName, 1, {"v.cfg:2: ", "Volume: expected a name"});
   EXPECT_LT(longName.err.size(), 500u);
 
+  // Many sections, the last repeating the first: found without comparing
+  // every pair.
+  std::string many = "[Global]\n";
+  for (int i = 0; i < 200000; ++i) many += "[Disk d" + std::to_string(i) + "]\n";
+  writeVolumeFile("v.cfg", many + "[Disk d0]\n");
+  expectFailure(convert("v", "v.cfg"), 1,
+                {"v.cfg:200002: ", "duplicate section [Disk d0] (first at line 2)"});
+
   // Binary garbage in both forms, from a fixed seed.
   std::mt19937 random(20240611);
   std::string garbage(64 << 10, '\0');
