@@ -90,15 +90,15 @@ class TextReader {
       return fail("a section header is \"[Kind]\" or \"[Kind name]\"; found " +
                   quoteForMessage(line));
     }
-    const SectionSpec* spec = findSection(words[0], Syntax::kText);
-    if (spec == nullptr) {
+    const SectionDefinition* definition = findSection(words[0], Syntax::kText);
+    if (definition == nullptr) {
       return fail("unknown section " + quoteForMessage(words[0]) + "; the sections are " +
                   sectionList());
     }
     std::optional<std::string_view> name;
     if (words.size() == 2) name = words[1];
-    if (!builder_.beginSection(*spec, name, number_, error_)) return false;
-    section_ = spec;
+    if (!builder_.beginSection(*definition, name, number_, error_)) return false;
+    section_ = definition;
     header_ = std::string(line);
     return true;
   }
@@ -108,10 +108,10 @@ class TextReader {
     if (section_ == nullptr) {
       return fail("the setting " + quoteForMessage(words[0]) + " comes before any section header");
     }
-    const KeySpec* key = findKey(*section_, words[0], Syntax::kText);
+    const KeyDefinition* key = findKey(*section_, words[0], Syntax::kText);
     if (key == nullptr) {
       std::string known;
-      for (const KeySpec& k : section_->keys)
+      for (const KeyDefinition& k : section_->keys)
         known += (known.empty() ? "" : ", ") + std::string(k.name);
       return fail("unknown key " + quoteForMessage(words[0]) + " in " + header_ +
                   "; its keys are " + known);
@@ -123,7 +123,7 @@ class TextReader {
   VolumeBuilder& builder_;
   ConversionError* error_;
   int number_ = 0;
-  const SectionSpec* section_ = nullptr;
+  const SectionDefinition* section_ = nullptr;
   std::string header_;
 };
 

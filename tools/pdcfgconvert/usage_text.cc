@@ -113,7 +113,7 @@ order, each with its "name", its keys and "nodes" sorted by index) and, with
 -A, "auxData". Keys that the source leaves out appear with their defaults.
 )";
 
-std::string describeField(const FieldSpec& field) {
+std::string describeField(const FieldDefinition& field) {
   const auto bound = [&field](std::int64_t b) {
     return field.kind == ValueKind::kSize ? formatSizeText(b) : std::to_string(b);
   };
@@ -142,7 +142,7 @@ std::string describeField(const FieldSpec& field) {
   return {};
 }
 
-std::string describeKey(const KeySpec& key) {
+std::string describeKey(const KeyDefinition& key) {
   std::string text = "    " + std::string(key.name);
   if (!key.outputKey.empty()) text += " (" + std::string(key.outputKey) + ")";
   if (key.outputKey.empty()) text += " (checked against -n, not written out)";
@@ -167,13 +167,13 @@ std::string describeKey(const KeySpec& key) {
 std::string usageText() {
   std::string text(kUsageLine);
   text += kIntroduction;
-  for (const SectionSpec& section : volumeSchema()) {
+  for (const SectionDefinition& section : volumeSchema()) {
     text += "  [" + std::string(section.name) + (section.named ? " <name>]" : "]");
     if (section.kind == SectionKind::kDisk) text += " (under \"disks\")";
     if (section.kind == SectionKind::kStripeGroup) text += " (in \"stripeGroups\")";
     if (section.kind == SectionKind::kGlobal) text += " (\"global\")";
     text += "\n";
-    for (const KeySpec& key : section.keys) text += describeKey(key);
+    for (const KeyDefinition& key : section.keys) text += describeKey(key);
   }
   text += kRules;
   return text;

@@ -43,8 +43,8 @@ std::int64_t integerOf(const Value& value) {
 }
 
 // The key spelled `name` in .cfg; every caller names a key of the table.
-const KeySpec& keyNamed(const SectionSpec& section, std::string_view name) {
-  const KeySpec* key = findKey(section, name, Syntax::kText);
+const KeyDefinition& keyNamed(const SectionDefinition& section, std::string_view name) {
+  const KeyDefinition* key = findKey(section, name, Syntax::kText);
   assert(key != nullptr);
   return *key;
 }
@@ -53,15 +53,15 @@ const KeySpec& keyNamed(const SectionSpec& section, std::string_view name) {
 
 std::string VolumeBuilder::describe(const Section& section) const {
   if (syntax_ == Syntax::kXml) {
-    std::string text = "<" + spell(section.spec->name, syntax_);
-    if (section.spec->named) text += " name=\"" + section.name + "\"";
+    std::string text = "<" + spell(section.definition->name, syntax_);
+    if (section.definition->named) text += " name=\"" + section.name + "\"";
     return text + ">";
   }
-  if (!section.spec->named) return "[" + std::string(section.spec->name) + "]";
-  return "[" + std::string(section.spec->name) + " " + section.name + "]";
+  if (!section.definition->named) return "[" + std::string(section.definition->name) + "]";
+  return "[" + std::string(section.definition->name) + " " + section.name + "]";
 }
 
-std::string VolumeBuilder::describe(const KeySpec& key) const {
+std::string VolumeBuilder::describe(const KeyDefinition& key) const {
   if (syntax_ == Syntax::kXml) return "<" + spell(key.name, syntax_) + ">";
   return std::string(key.name);
 }
@@ -72,7 +72,8 @@ bool VolumeBuilder::fail(ConversionError* error, int line, std::string message) 
   return false;
 }
 
-std::optional<Value> VolumeBuilder::convertField(const FieldSpec& field, std::string_view text,
+std::optional<Value> VolumeBuilder::convertField(const FieldDefinition& field,
+                                                 std::string_view text,
                                                  std::string* problem) const {
   const std::string found = ", found " + quoteForMessage(text);
   switch (field.kind) {
@@ -112,15 +113,16 @@ std::optional<Value> VolumeBuilder::convertField(const FieldSpec& field, std::st
   return std::nullopt;
 }
 
-bool VolumeBuilder::beginSection(const SectionSpec& spec, std::optional<std::string_view> name,
-                                 int line, ConversionError* error) {
+bool VolumeBuilder::beginSection(const SectionDefinition& definition,
+                                 std::optional<std::string_view> name, int line,
+                                 ConversionError* error) {
   const bool xml = syntax_ == Syntax::kXml;
   const std::string plain =
-      xml ? "<" + spell(spec.name, syntax_) + ">" : "[" + std::string(spec.name) + "]";
-  if (name && !spec.named) {
+      xml ? "<" + spell(definition.name, syntax_) + ">" : "[" + std::string(definition.name) + "]";
+  if (name && !definition.named) {
     return fail(error, line, plain + (xml ? " takes no name attribute" : " takes no name"));
   }
-  if (!name && spec.named) {
+  if (!name && definition.named) {
     return fail(error, line, plain + (xml ? " needs a name attribute" : " needs a name"));
   }
   if (name && !isNameText(*name)) {
@@ -129,11 +131,11 @@ bool VolumeBuilder::beginSection(const SectionSpec& spec, std::optional<std::str
                     std::string(kNameRule));
   }
   Section section;
-  section.spec = &spec;
+  section.definition = &definition;
   section.name = name ? std::string(*name) : std::string();
   section.line = line;
   // A map, not a scan of the sections: a 4 MiB source holds 10^5 of them.
-  const auto [earlier, isNew] = sectionLines_.try_emplace({spec.kind, section.name}, line);
+  const auto [earlier, isNew] = sectionLines_.try_emplace({definition.kind, section.name}, line);
   if (!isNew) {
     return fail(error, line,
                 "duplicate section " + describe(section) + " (first at line " +
@@ -143,8 +145,9 @@ bool VolumeBuilder::beginSection(const SectionSpec& spec, std::optional<std::str
   return true;
 }
 
-bool VolumeBuilder::addSetting(const KeySpec& key, const std::vector<std::string_view>& fieldTexts,
-                               int line, ConversionError* error) {
+bool VolumeBuilder::addSetting(const KeyDefinition& key,
+                               const std::vector<std::string_view>& fieldTexts, int line,
+                               ConversionError* error) {
   assert(!sections_.empty());
   Section& section = sections_.back();
   if (fieldTexts.size() != key.fields.size()) {
@@ -193,7 +196,7 @@ bool VolumeBuilder::addSetting(const KeySpec& key, const std::vector<std::string
 }
 
 bool VolumeBuilder::completeSection(Section& section, ConversionError* error) const {
-  for (const KeySpec& key : section.spec->keys) {
+  for (const KeyDefinition& key : section.definition->keys) {
     if (section.values.contains(key.name)) continue;
     if (key.required) {
       return fail(error, section.line, describe(section) + " has no " + describe(key));
@@ -223,11 +226,11 @@ bool VolumeBuilder::checkStripeGroups(ConversionError* error) const {
   const Section* journal = nullptr;
   bool anyGroup = false, anyMetadata = false;
   for (const Section& s : sections_) {
-    if (s.spec->kind == SectionKind::kGlobal) global = &s;
+    if (s.definition->kind == SectionKind::kGlobal) global = &s;
   }
   const std::int64_t blockSize = integerOf(*global->values.find("BlockSize"));
   for (const Section& s : sections_) {
-    if (s.spec->kind != SectionKind::kStripeGroup) continue;
+    if (s.definition->kind != SectionKind::kStripeGroup) continue;
     anyGroup = true;
     anyMetadata = anyMetadata || s.values.find("Metadata")->truthValue();
     if (s.values.find("Journal")->truthValue()) {
@@ -242,9 +245,9 @@ bool VolumeBuilder::checkStripeGroups(ConversionError* error) const {
     if (breadth % blockSize != 0) {
       const auto it = s.keyLines.find("StripeBreadth");
       return fail(error, it == s.keyLines.end() ? s.line : it->second.front(),
-                  describe(keyNamed(*s.spec, "StripeBreadth")) + " " + formatSizeText(breadth) +
-                      " of " + describe(s) + " is not a multiple of the block size " +
-                      formatSizeText(blockSize));
+                  describe(keyNamed(*s.definition, "StripeBreadth")) + " " +
+                      formatSizeText(breadth) + " of " + describe(s) +
+                      " is not a multiple of the block size " + formatSizeText(blockSize));
     }
   }
   const bool xml = syntax_ == Syntax::kXml;
@@ -269,12 +272,12 @@ bool VolumeBuilder::checkStripeGroups(ConversionError* error) const {
 bool VolumeBuilder::checkNodes(ConversionError* error) {
   std::map<std::string, int> diskLines;  // disk name -> line of its section
   for (const Section& s : sections_) {
-    if (s.spec->kind == SectionKind::kDisk) diskLines[s.name] = s.line;
+    if (s.definition->kind == SectionKind::kDisk) diskLines[s.name] = s.line;
   }
   std::map<std::string, int> diskUsedAt;  // disk name -> line of the node that uses it
   for (Section& s : sections_) {
-    if (s.spec->kind != SectionKind::kStripeGroup) continue;
-    const KeySpec& nodeKey = keyNamed(*s.spec, "Node");
+    if (s.definition->kind != SectionKind::kStripeGroup) continue;
+    const KeyDefinition& nodeKey = keyNamed(*s.definition, "Node");
     Array& nodes = *s.values.find("Node")->asArray();
     const std::vector<int>& lines = s.keyLines.at("Node");
     std::map<std::int64_t, int> indexLines;
@@ -318,7 +321,7 @@ std::optional<Value> VolumeBuilder::finish(std::string_view volumeName, Conversi
   const Section* global = nullptr;
   for (Section& s : sections_) {
     if (!completeSection(s, error)) return std::nullopt;
-    if (s.spec->kind == SectionKind::kGlobal) global = &s;
+    if (s.definition->kind == SectionKind::kGlobal) global = &s;
   }
   if (global == nullptr) {
     fail(error, 0,
@@ -335,7 +338,7 @@ std::optional<Value> VolumeBuilder::finish(std::string_view volumeName, Conversi
   // key stay an array.
   const auto outputOf = [](const Section& s) {
     Dictionary out;
-    for (const KeySpec& key : s.spec->keys) {
+    for (const KeyDefinition& key : s.definition->keys) {
       const Value* value = s.values.find(key.name);
       if (value != nullptr && !key.outputKey.empty()) out.set(std::string(key.outputKey), *value);
     }
@@ -346,7 +349,7 @@ std::optional<Value> VolumeBuilder::finish(std::string_view volumeName, Conversi
   Value volume = Value::dictionary();
   volume.set("name", Value(volumeName));
   for (const Section& s : sections_) {
-    switch (s.spec->kind) {
+    switch (s.definition->kind) {
       case SectionKind::kGlobal:
         volume.set("global", Value(outputOf(s)));
         break;

@@ -25,15 +25,15 @@ class VolumeBuilder {
 
   // Starts a section at `line`; `name` is absent when the source gave none.
   // Fails for a missing, superfluous, malformed or repeated name.
-  bool beginSection(const SectionSpec& spec, std::optional<std::string_view> name, int line,
-                    ConversionError* error);
+  bool beginSection(const SectionDefinition& definition, std::optional<std::string_view> name,
+                    int line, ConversionError* error);
 
   // Records `key` of the current section at `line`; `fieldTexts` holds one
   // text per field of the key, in the key's field order. Fails for a value of
   // the wrong kind or out of bounds, and for a key given twice that is not
   // repeatable. Call only after beginSection.
-  bool addSetting(const KeySpec& key, const std::vector<std::string_view>& fieldTexts, int line,
-                  ConversionError* error);
+  bool addSetting(const KeyDefinition& key, const std::vector<std::string_view>& fieldTexts,
+                  int line, ConversionError* error);
 
   // Applies defaults, checks the volume as a whole (required sections and
   // keys, the stripe groups, their disks and nodes, the stored volume name
@@ -44,7 +44,7 @@ class VolumeBuilder {
 
  private:
   struct Section {
-    const SectionSpec* spec = nullptr;
+    const SectionDefinition* definition = nullptr;
     std::string name;
     int line = 0;
     kolt::Dictionary values;
@@ -52,9 +52,9 @@ class VolumeBuilder {
   };
 
   std::string describe(const Section& section) const;
-  std::string describe(const KeySpec& key) const;
+  std::string describe(const KeyDefinition& key) const;
   bool fail(ConversionError* error, int line, std::string message) const;
-  std::optional<kolt::Value> convertField(const FieldSpec& field, std::string_view text,
+  std::optional<kolt::Value> convertField(const FieldDefinition& field, std::string_view text,
                                           std::string* problem) const;
   bool completeSection(Section& section, ConversionError* error) const;
   bool checkVolumeName(const Section& global, std::string_view volumeName,

@@ -9,51 +9,52 @@ constexpr std::int64_t kKiB = 1024;
 constexpr std::int64_t kMiB = 1024 * kKiB;
 constexpr std::int64_t kGiB = 1024 * kMiB;
 
-FieldSpec field(ValueKind kind) {
-  FieldSpec f;
+FieldDefinition field(ValueKind kind) {
+  FieldDefinition f;
   f.kind = kind;
   return f;
 }
-FieldSpec bounded(ValueKind kind, std::int64_t min, std::int64_t max, bool powerOfTwo = false) {
-  FieldSpec f = field(kind);
+FieldDefinition bounded(ValueKind kind, std::int64_t min, std::int64_t max,
+                        bool powerOfTwo = false) {
+  FieldDefinition f = field(kind);
   f.min = min;
   f.max = max;
   f.powerOfTwo = powerOfTwo;
   return f;
 }
-FieldSpec choice(std::vector<std::string_view> words) {
-  FieldSpec f = field(ValueKind::kChoice);
+FieldDefinition choice(std::vector<std::string_view> words) {
+  FieldDefinition f = field(ValueKind::kChoice);
   f.choices = std::move(words);
   return f;
 }
 
 // A key of one value; without a default it is optional and left out when
 // absent.
-KeySpec key(std::string_view name, std::string_view outputKey, FieldSpec value,
-            std::string_view defaultText = {}) {
-  KeySpec k;
+KeyDefinition key(std::string_view name, std::string_view outputKey, FieldDefinition value,
+                  std::string_view defaultText = {}) {
+  KeyDefinition k;
   k.name = name;
   k.outputKey = outputKey;
   k.fields = {std::move(value)};
   k.defaultText = defaultText;
   return k;
 }
-KeySpec required(KeySpec k) {
+KeyDefinition required(KeyDefinition k) {
   k.required = true;
   return k;
 }
 
-std::vector<SectionSpec> buildSchema() {
+std::vector<SectionDefinition> buildSchema() {
   constexpr std::int64_t kMax = std::numeric_limits<std::int64_t>::max();
-  const FieldSpec boolean = field(ValueKind::kBoolean);
-  const FieldSpec name = field(ValueKind::kName);
+  const FieldDefinition boolean = field(ValueKind::kBoolean);
+  const FieldDefinition name = field(ValueKind::kName);
 
   // "Node <disk> <index>": one disk of a stripe group, at its position.
-  FieldSpec disk = name;
+  FieldDefinition disk = name;
   disk.name = "disk";
-  FieldSpec index = bounded(ValueKind::kInteger, 0, 65535);
+  FieldDefinition index = bounded(ValueKind::kInteger, 0, 65535);
   index.name = "index";
-  KeySpec node = required(key("Node", "nodes", disk));
+  KeyDefinition node = required(key("Node", "nodes", disk));
   node.fields.push_back(index);
   node.repeatable = true;
 
@@ -101,8 +102,8 @@ std::vector<SectionSpec> buildSchema() {
 
 }  // namespace
 
-const std::vector<SectionSpec>& volumeSchema() {
-  static const std::vector<SectionSpec> schema = buildSchema();
+const std::vector<SectionDefinition>& volumeSchema() {
+  static const std::vector<SectionDefinition> schema = buildSchema();
   return schema;
 }
 
@@ -114,15 +115,16 @@ std::string spell(std::string_view name, Syntax syntax) {
   return spelled;
 }
 
-const SectionSpec* findSection(std::string_view spelled, Syntax syntax) {
-  for (const SectionSpec& section : volumeSchema()) {
+const SectionDefinition* findSection(std::string_view spelled, Syntax syntax) {
+  for (const SectionDefinition& section : volumeSchema()) {
     if (spell(section.name, syntax) == spelled) return &section;
   }
   return nullptr;
 }
 
-const KeySpec* findKey(const SectionSpec& section, std::string_view spelled, Syntax syntax) {
-  for (const KeySpec& key : section.keys) {
+const KeyDefinition* findKey(const SectionDefinition& section, std::string_view spelled,
+                             Syntax syntax) {
+  for (const KeyDefinition& key : section.keys) {
     if (spell(key.name, syntax) == spelled) return &key;
   }
   return nullptr;

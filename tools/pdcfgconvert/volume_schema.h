@@ -27,7 +27,7 @@ enum class ValueKind {
 // One value of a key. A key has one field (its value), or several fields that
 // form a record (written as positional values in .cfg, as attributes in
 // .cfgx).
-struct FieldSpec {
+struct FieldDefinition {
   std::string_view name;  // the record's key and the .cfgx attribute; empty for a one-field key
   ValueKind kind = ValueKind::kName;
   std::int64_t min = 0;  // inclusive bounds of integers and sizes
@@ -36,10 +36,10 @@ struct FieldSpec {
   std::vector<std::string_view> choices;  // for kChoice, as written in both forms
 };
 
-struct KeySpec {
+struct KeyDefinition {
   std::string_view name;       // as written in .cfg
   std::string_view outputKey;  // key in the output; empty: checked but not written out
-  std::vector<FieldSpec> fields;
+  std::vector<FieldDefinition> fields;
   std::string_view defaultText;  // used when the key is absent; empty: none
   bool required = false;         // the section must hold the key at least once
   bool repeatable = false;       // every occurrence appends a record to an array
@@ -47,19 +47,20 @@ struct KeySpec {
 
 enum class SectionKind { kGlobal, kDisk, kStripeGroup };
 
-struct SectionSpec {
+struct SectionDefinition {
   SectionKind kind;
   std::string_view name;  // as written in .cfg
   bool named;             // "[Disk D0]" carries a name; "[Global]" does not
-  std::vector<KeySpec> keys;
+  std::vector<KeyDefinition> keys;
 };
 
 // Every section kind, in the order the usage text lists them.
-const std::vector<SectionSpec>& volumeSchema();
+const std::vector<SectionDefinition>& volumeSchema();
 
 // The section or key spelled `spelled` in `syntax`, or null.
-const SectionSpec* findSection(std::string_view spelled, Syntax syntax);
-const KeySpec* findKey(const SectionSpec& section, std::string_view spelled, Syntax syntax);
+const SectionDefinition* findSection(std::string_view spelled, Syntax syntax);
+const KeyDefinition* findKey(const SectionDefinition& section, std::string_view spelled,
+                             Syntax syntax);
 
 // `name` as written in `syntax`: unchanged for text, first letter lowered for
 // XML.

@@ -124,7 +124,7 @@ class XmlReader {
     section_ = findSection(name, Syntax::kXml);
     if (section_ == nullptr) {
       std::string known;
-      for (const SectionSpec& s : volumeSchema()) {
+      for (const SectionDefinition& s : volumeSchema()) {
         known += (known.empty() ? "<" : ", <") + spell(s.name, Syntax::kXml) + ">";
       }
       return fail("unknown element " + element + " in <" + std::string(kRootElement) +
@@ -145,7 +145,7 @@ class XmlReader {
     key_ = findKey(*section_, name, Syntax::kXml);
     if (key_ == nullptr) {
       std::string known;
-      for (const KeySpec& k : section_->keys) {
+      for (const KeyDefinition& k : section_->keys) {
         known += (known.empty() ? "<" : ", <") + spell(k.name, Syntax::kXml) + ">";
       }
       return fail("unknown element " + element + " in " + sectionElement_ + "; its keys are " +
@@ -206,9 +206,9 @@ class XmlReader {
   XML_Parser parser_ = nullptr;
   bool failed_ = false;
   int depth_ = 0;
-  const SectionSpec* section_ = nullptr;
+  const SectionDefinition* section_ = nullptr;
   std::string sectionElement_;
-  const KeySpec* key_ = nullptr;
+  const KeyDefinition* key_ = nullptr;
   int keyLine_ = 0;
   std::string text_;
   std::vector<std::string> fieldTexts_;

@@ -71,13 +71,13 @@ class PdcfgconvertTest : public ::testing::Test {
   // KOLT_ROOT, standard input the null device and standard output a pipe.
   RunResult runIn(Env& env, const std::string& executable, std::vector<std::string> arguments) {
     std::ofstream(root_ / fs::path(kStderrPath).relative_path(), std::ios::trunc).flush();
-    ProcessSpec spec;
-    spec.executable = executable;
-    spec.arguments = std::move(arguments);
-    spec.standardOutput = StreamSpec::pipe();
-    spec.standardError = StreamSpec::appendTo(kStderrPath);
+    ProcessSpec child;
+    child.executable = executable;
+    child.arguments = std::move(arguments);
+    child.standardOutput = StreamSpec::pipe();
+    child.standardError = StreamSpec::appendTo(kStderrPath);
     ProcessResult process;
-    EXPECT_EQ(env.runProcess(spec, /*wait=*/true, &process), 0);
+    EXPECT_EQ(env.runProcess(child, /*wait=*/true, &process), 0);
     return {process.exitStatus, process.output,
             readHostFile(root_ / fs::path(kStderrPath).relative_path())};
   }
@@ -457,13 +457,13 @@ TEST_F(PdcfgconvertTest, FailureToWriteTheOutputIsReported) {
   fs::create_directories(root_ / "dev");
   fs::create_symlink("/dev/full", root_ / "dev/full");
   std::ofstream(root_ / fs::path(kStderrPath).relative_path(), std::ios::trunc).flush();
-  ProcessSpec spec;
-  spec.executable = kToolPath;
-  spec.arguments = {"-n", "Scratch", std::string(kVolumeDirectory) + "Scratch.cfg"};
-  spec.standardOutput = StreamSpec::appendTo("/dev/full");
-  spec.standardError = StreamSpec::appendTo(kStderrPath);
+  ProcessSpec child;
+  child.executable = kToolPath;
+  child.arguments = {"-n", "Scratch", std::string(kVolumeDirectory) + "Scratch.cfg"};
+  child.standardOutput = StreamSpec::appendTo("/dev/full");
+  child.standardError = StreamSpec::appendTo(kStderrPath);
   ProcessResult process;
-  ASSERT_EQ(env_->runProcess(spec, /*wait=*/true, &process), 0);
+  ASSERT_EQ(env_->runProcess(child, /*wait=*/true, &process), 0);
   EXPECT_EQ(process.exitStatus, 1);
   EXPECT_NE(readHostFile(root_ / fs::path(kStderrPath).relative_path())
                 .find("cannot write to standard output"),
