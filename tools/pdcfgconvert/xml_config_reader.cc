@@ -87,8 +87,8 @@ class XmlReader {
     error_->message = std::move(message);
     XML_StopParser(parser_, XML_FALSE);
   }
-  void failWith(bool ok) {
-    // The builder has filled in the error already.
+  // Stops after a step that the builder refused; it has filled in the error.
+  void stopUnless(bool ok) {
     if (ok || failed_) return;
     failed_ = true;
     XML_StopParser(parser_, XML_FALSE);
@@ -97,7 +97,10 @@ class XmlReader {
   void start(std::string_view name, const XML_Char** attributes) {
     if (failed_) return;
     ++depth_;
-    const std::string element = "<" + std::string(name) + ">";
+    // Element names are unbounded in XML; a message shows the start of one.
+    constexpr std::size_t kShown = 40;
+    const std::string element =
+        "<" + std::string(name.substr(0, kShown)) + (name.size() > kShown ? "...>" : ">");
     if (depth_ == 1) return startRoot(name, element, attributes);
     if (depth_ == 2) return startSection(name, element, attributes);
     if (depth_ == 3) return startKey(name, element, attributes);
@@ -138,7 +141,7 @@ class XmlReader {
       sectionName = a[1];
     }
     sectionElement_ = element;
-    failWith(builder_.beginSection(*section_, sectionName, currentLine(), error_));
+    stopUnless(builder_.beginSection(*section_, sectionName, currentLine(), error_));
   }
 
   void startKey(std::string_view name, const std::string& element, const XML_Char** attributes) {
@@ -196,7 +199,7 @@ class XmlReader {
     if (depth_ == 3) {
       std::vector<std::string_view> fields(fieldTexts_.begin(), fieldTexts_.end());
       if (key_->fields.size() == 1) fields = {trimXmlSpace(text_)};
-      failWith(builder_.addSetting(*key_, fields, keyLine_, error_));
+      stopUnless(builder_.addSetting(*key_, fields, keyLine_, error_));
     }
     --depth_;
   }

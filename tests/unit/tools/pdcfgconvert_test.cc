@@ -582,6 +582,12 @@ TEST_F(PdcfgconvertTest, HostileSourcesFailCleanly) {
   writeVolumeFile("v.cfgx", deep);
   expectFailure(convert("v", "v.cfgx"), 1, {"unexpected element <a> inside <fileLocks>"});
 
+  // An element name of a megabyte is shown cut short.
+  writeVolumeFile("v.cfgx", "<volumeConfig><" + std::string(1 << 20, 'g') + "/></volumeConfig>");
+  const RunResult longElement = convert("v", "v.cfgx");
+  expectFailure(longElement, 1, {"v.cfgx:1: ", "unknown element <gggg"});
+  EXPECT_LT(longElement.err.size(), 500u);
+
   // Entity expansion cannot start: the document type declaration is refused.
   std::string laughs = "<?xml version=\"1.0\"?>\n<!DOCTYPE v [<!ENTITY l0 \"ha\">";
   for (int i = 1; i < 12; ++i) {
