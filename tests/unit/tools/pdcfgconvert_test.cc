@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "fixtures/sandbox.h"
 #include "kolt/env.h"
 #include "kolt/error.h"
 #include "kolt/plist.h"
@@ -20,7 +21,7 @@ namespace {
 namespace fs = std::filesystem;
 using namespace std::string_literals;
 
-constexpr const char* kToolPath = "/System/Library/Filesystems/kolt.fs/Contents/bin/pdcfgconvert";
+const std::string kToolPath = std::string(testing::kToolDirectory) + "pdcfgconvert";
 constexpr const char* kVolumeDirectory = "/Library/Preferences/Vorn/";
 constexpr const char* kStderrPath = "/converter-stderr.txt";
 const fs::path kSamples = fs::path(KOLT_SOURCE_DIR) / "tests/fixtures/volumes";
@@ -47,42 +48,36 @@ struct RunResult {
 class PdcfgconvertTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    std::random_device random;
-    root_ = fs::temp_directory_path() / ("kolt-pdcfgconvert-" + std::to_string(random()));
-    fs::create_directories(root_ / "Library/Preferences/Vorn");
-    const fs::path tool = root_ / fs::path(kToolPath).relative_path();
-    fs::create_directories(tool.parent_path());
-    fs::copy_file(fs::path(KOLT_BINARY_DIR) / "pdcfgconvert", tool);
-    env_ = newPosixEnv(root_.string());
+    fs::copy_file(fs::path(KOLT_BINARY_DIR) / "pdcfgconvert", sandbox_.hostPath(kToolPath));
   }
-  void TearDown() override { fs::remove_all(root_); }
 
   fs::path hostVolumePath(const std::string& fileName) const {
-    return root_ / "Library/Preferences/Vorn" / fileName;
+    return sandbox_.hostPath(kVolumeDirectory + fileName);
   }
   void writeVolumeFile(const std::string& fileName, const std::string& contents) {
-    std::ofstream(hostVolumePath(fileName), std::ios::binary | std::ios::trunc) << contents;
+    sandbox_.writeFile(kVolumeDirectory + fileName, contents);
   }
   void installSample(const std::string& fileName) {
     writeVolumeFile(fileName, readHostFile(kSamples / fileName));
   }
 
-  // Runs the tool at its system path inside the root, with `env`'s root as
-  // KOLT_ROOT, standard input the null device and standard output a pipe.
-  RunResult runIn(Env& env, const std::string& executable, std::vector<std::string> arguments) {
-    std::ofstream(root_ / fs::path(kStderrPath).relative_path(), std::ios::trunc).flush();
+  // Runs `executable` through `env` (which names its root in KOLT_ROOT) with
+  // standard input the null device, standard output `output` and standard
+  // error a file of the sandbox.
+  RunResult runIn(Env& env, const std::string& executable, std::vector<std::string> arguments,
+                  StreamSpec output = StreamSpec::pipe()) {
+    sandbox_.writeFile(kStderrPath, "");
     ProcessSpec child;
     child.executable = executable;
     child.arguments = std::move(arguments);
-    child.standardOutput = StreamSpec::pipe();
+    child.standardOutput = std::move(output);
     child.standardError = StreamSpec::appendTo(kStderrPath);
     ProcessResult process;
     EXPECT_EQ(env.runProcess(child, /*wait=*/true, &process), 0);
-    return {process.exitStatus, process.output,
-            readHostFile(root_ / fs::path(kStderrPath).relative_path())};
+    return {process.exitStatus, process.output, sandbox_.readFile(kStderrPath).value_or("")};
   }
   RunResult run(std::vector<std::string> arguments) {
-    return runIn(*env_, kToolPath, std::move(arguments));
+    return runIn(sandbox_.env(), kToolPath, std::move(arguments));
   }
   // The volume collection's command line for a source file of the directory.
   RunResult convert(const std::string& volume, const std::string& fileName, bool auxData = false) {
@@ -115,8 +110,7 @@ class PdcfgconvertTest : public ::testing::Test {
     }
   }
 
-  fs::path root_;
-  std::unique_ptr<Env> env_;
+  testing::Sandbox sandbox_;
 };
 
 Value disk(std::int64_t sectors, std::int64_t sectorSize) {
@@ -454,20 +448,12 @@ TEST_F(PdcfgconvertTest, ValuesAtTheirBoundaries) {
 
 TEST_F(PdcfgconvertTest, FailureToWriteTheOutputIsReported) {
   installSample("Scratch.cfg");
-  fs::create_directories(root_ / "dev");
-  fs::create_symlink("/dev/full", root_ / "dev/full");
-  std::ofstream(root_ / fs::path(kStderrPath).relative_path(), std::ios::trunc).flush();
-  ProcessSpec child;
-  child.executable = kToolPath;
-  child.arguments = {"-n", "Scratch", std::string(kVolumeDirectory) + "Scratch.cfg"};
-  child.standardOutput = StreamSpec::appendTo("/dev/full");
-  child.standardError = StreamSpec::appendTo(kStderrPath);
-  ProcessResult process;
-  ASSERT_EQ(env_->runProcess(child, /*wait=*/true, &process), 0);
-  EXPECT_EQ(process.exitStatus, 1);
-  EXPECT_NE(readHostFile(root_ / fs::path(kStderrPath).relative_path())
-                .find("cannot write to standard output"),
-            std::string::npos);
+  sandbox_.makeDirectory("/dev");
+  fs::create_symlink("/dev/full", sandbox_.hostPath("/dev/full"));
+  const RunResult result = runIn(sandbox_.env(), kToolPath,
+                                 {"-n", "Scratch", std::string(kVolumeDirectory) + "Scratch.cfg"},
+                                 StreamSpec::appendTo("/dev/full"));
+  expectFailure(result, 1, {"cannot write to standard output"});
 }
 
 TEST_F(PdcfgconvertTest, TextSourceErrorsNameTheProblemAndTheLine) {
