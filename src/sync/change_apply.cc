@@ -15,18 +15,20 @@ namespace kolt {
 namespace {
 
 // The keys that members copy from the published globals, in order.
-constexpr const char* kCopiedKeys[] = {"sanConfigURLs", "desiredSearchPolicy", "notifications",
-                                       "ownerEmail",    "ownerName",           "sanAuthMethod",
-                                       "primaryZombie", "sanState"};
+constexpr const char* kCopiedKeys[] = {
+    "sanConfigURLs", "desiredSearchPolicy", "notifications", "ownerEmail",
+    "ownerName",     "sanAuthMethod",       "primaryZombie", "sanState"};
 
-// The first entry of "sanConfigURLs" (an array, or one string).
+// The first entry of "sanConfigURLs" (an array, or one string), when it is
+// a non-empty string: an empty one would name no server.
 const std::string* firstConfigURL(const Value& globals) {
   const Value* urls = globals.find("sanConfigURLs");
   if (urls == nullptr) return nullptr;
-  if (const std::string* one = urls->asString()) return one->empty() ? nullptr : one;
-  const Array* many = urls->asArray();
-  if (many == nullptr || many->empty()) return nullptr;
-  return many->front().asString();
+  const std::string* first = urls->asString();
+  if (const Array* many = urls->asArray(); many != nullptr && !many->empty()) {
+    first = many->front().asString();
+  }
+  return first != nullptr && !first->empty() ? first : nullptr;
 }
 
 void trustControllers(const Value& globals) {
@@ -125,11 +127,14 @@ int applyConfiguration(const ApplyContext& c) {
   working.set("role", role);
   mask |= kChangeApplied;
 
-  if (c.volumes != nullptr) updateFromVolumeConfig(*c.volumes);
+  // Volumes that are no dictionary name no volume: applying them would
+  // remove every local volume file, so they are left out.
+  if (c.volumes != nullptr && c.volumes->isDictionary()) updateFromVolumeConfig(*c.volumes);
 
   working.erase("configIsNew");
   working.erase("sharedSecret");
-  if (!saveConfigPlist(working)) return Error::posix(kPosixEINVAL, "Error saving config.plist").status();
+  if (!saveConfigPlist(working))
+    return Error::posix(kPosixEINVAL, "Error saving config.plist").status();
 
   const std::string* state = working.findString("sanState");
   if (state != nullptr && *state == "dead") {
