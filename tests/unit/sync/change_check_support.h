@@ -122,7 +122,7 @@ inline bool publish(DirectoryNode& adminNode, const Value& config, std::string* 
   const std::string sanName = kSanName;
   const std::string secret = kSecret;
   ErrorSlot error;
-  if (!getVornConfig(adminNode, &sanName, &error)) {
+  if (!getVornConfig(adminNode, &sanName, &error) && error && error->code() == 501) {
     error.reset();
     if (createNewVornConfig(adminNode, &sanName, &secret, &error) != 0) {
       if (why != nullptr) *why = error ? error->printed() : "create failed";
