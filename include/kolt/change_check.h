@@ -15,11 +15,11 @@ namespace kolt {
 
 // Bits of the change mask.
 enum ChangeMaskBit : std::uint32_t {
-  kChangeApplied = 0x01,          // the published configuration was applied
-  kChangeRole = 0x02,             // the role changed (not controller to client) or was unknown
-  kChangeQuerixServer = 0x04,     // the search-service settings differ
+  kChangeApplied = 0x01,             // the published configuration was applied
+  kChangeRole = 0x02,                // the role changed (not controller to client) or was unknown
+  kChangeQuerixServer = 0x04,        // the search-service settings differ
   kChangeControllerToClient = 0x08,  // controller became client; the profile is being unloaded
-  kChangeNewConfig = 0x40,        // a new configuration document was handed in
+  kChangeNewConfig = 0x40,           // a new configuration document was handed in
 };
 
 // checkSanConfigChangeWithServer without a server.
@@ -38,8 +38,12 @@ KOLT_EXPORT int checkSanConfigChange(std::uint32_t* changeMask, Value* newConfig
 // configuration record). Nothing local is written before the configuration
 // was fetched. The shared secret is never saved in config.plist; it lives in
 // ".auth_secret" (mode 0600).
-KOLT_EXPORT int checkSanConfigChangeWithServer(const std::string* server,
-                                               std::uint32_t* changeMask, Value* newConfig);
+//
+// When the published revision equals the applied one ("sanRevision"), only
+// the configuration's "globals" are read, and only they are logged ("Got
+// config"); the rest of the stored configuration is not looked at.
+KOLT_EXPORT int checkSanConfigChangeWithServer(const std::string* server, std::uint32_t* changeMask,
+                                               Value* newConfig);
 
 // Starts "vornctl unloadProfile" without waiting and logs
 // "vornctl unloadProfile launched".

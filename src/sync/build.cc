@@ -12,8 +12,8 @@
 #include "kolt/env.h"
 #include "kolt/local_config.h"
 #include "kolt/log.h"
-#include "sync/metadata_address.h"
 #include "kolt/volume_files.h"
+#include "sync/metadata_address.h"
 #include "volumes/key_operations.h"
 #include "volumes/nameservers.h"
 #include "volumes/volume_collection.h"
@@ -40,13 +40,15 @@ Error orFallback(ErrorSlot slot, const char* what) {
 // The record's "globals", made a dictionary when it is not one.
 Value& globalsOf(Value& record) {
   Value* globals = record.find("globals");
-  if (globals == nullptr || !globals->isDictionary()) globals = &record.set("globals", Value::dictionary());
+  if (globals == nullptr || !globals->isDictionary())
+    globals = &record.set("globals", Value::dictionary());
   return *globals;
 }
 
 Value& volumesOf(Value& record) {
   Value* volumes = record.find("volumes");
-  if (volumes == nullptr || !volumes->isDictionary()) volumes = &record.set("volumes", Value::dictionary());
+  if (volumes == nullptr || !volumes->isDictionary())
+    volumes = &record.set("volumes", Value::dictionary());
   return *volumes;
 }
 
@@ -134,7 +136,8 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
       }
       if (std::optional<Error> error = createRecords(*directory, *local)) return error;
       startNew = true;
-    } else if (fetchedGlobals.find("sanName") == nullptr && fetchedGlobals.find("sanUUID") == nullptr) {
+    } else if (fetchedGlobals.find("sanName") == nullptr &&
+               fetchedGlobals.find("sanUUID") == nullptr) {
       // Records created by an earlier build that failed before its first
       // save: fill them like new ones instead of refusing them forever.
       startNew = true;
@@ -163,14 +166,15 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
   Value& globals = globalsOf(*record);
 
   std::uint8_t copied = 0;
-  for (const char* key : kPublishedKeys) copyValue(globals.asDictionary(), *local->asDictionary(), key, &copied);
+  for (const char* key : kPublishedKeys)
+    copyValue(globals.asDictionary(), *local->asDictionary(), key, &copied);
   update_from_file(globals.asDictionary(), ".auth_secret", "sharedSecret", &copied);
   update_from_file(globals.asDictionary(), "fsports", "fsports", &copied);
   if (copied & 1) flags |= kBuildPublish;
 
   const Value* previousControllers = globals.find("controllers");
   Value table = previousControllers && previousControllers->isDictionary() ? *previousControllers
-                                                                             : Value::dictionary();
+                                                                           : Value::dictionary();
   const bool hadControllers = previousControllers != nullptr;
   const Value before = hadControllers ? *previousControllers : Value();
   if (const Value* computers = local->find("computers")) {
@@ -211,7 +215,8 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
       if (aliasUUID != ourUUID) {
         Value& recordGlobals = globalsOf(*record);
         Value* aliases = recordGlobals.find("aliasControllers");
-        if (aliases == nullptr || !aliases->isArray()) aliases = &recordGlobals.set("aliasControllers", Value::array());
+        if (aliases == nullptr || !aliases->isArray())
+          aliases = &recordGlobals.set("aliasControllers", Value::array());
         aliases->asArray()->push_back(Value(aliasUUID));
         deleteControllerByUUID(recordGlobals, volumesOf(*record), aliasUUID);
       }

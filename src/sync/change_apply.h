@@ -11,12 +11,12 @@
 namespace kolt {
 
 struct ApplyContext {
-  Value* newConfig = nullptr;  // the handed-in document, or null
-  Value* loaded = nullptr;     // config.plist as loaded, or null
-  Value* working = nullptr;    // newConfig, else loaded
-  Value* globals = nullptr;    // the fetched globals (may be the working document itself)
+  Value* newConfig = nullptr;      // the handed-in document, or null
+  Value* loaded = nullptr;         // config.plist as loaded, or null
+  Value* working = nullptr;        // newConfig, else loaded
+  Value* globals = nullptr;        // the fetched globals (may be the working document itself)
   const Value* volumes = nullptr;  // the fetched "volumes", or null
-  bool usedNode = false;       // the configuration came from a directory node
+  bool usedNode = false;           // the configuration came from a directory node
   std::uint32_t* changeMask = nullptr;
 };
 

@@ -10,8 +10,9 @@
 #include "kolt/error.h"
 #include "kolt/local_config.h"
 #include "kolt/log.h"
-#include "sync/change_apply.h"
 #include "kolt/volume_files.h"
+#include "sync/change_apply.h"
+#include "sync/change_check_fetch.h"
 #include "volumes/key_operations.h"
 
 namespace kolt {
@@ -63,7 +64,9 @@ NodeChoice chooseNode(const std::vector<std::string>& urls, const std::string& u
   return choice;
 }
 
-int codeOf(const ErrorSlot& slot) { return slot ? slot->status() : 0; }
+int codeOf(const ErrorSlot& slot) {
+  return slot ? slot->status() : 0;
+}
 
 }  // namespace
 
@@ -78,7 +81,8 @@ int checkSanConfigChangeWithServer(const std::string* server, std::uint32_t* cha
 
   std::optional<std::string> secret;
   if (newConfig != nullptr) {
-    if (newConfig->findString("sanName") == nullptr) return Error::vorn(kVornSanNameMissing).status();
+    if (newConfig->findString("sanName") == nullptr)
+      return Error::vorn(kVornSanNameMissing).status();
     if (!newConfig->find("sanConfigURLs") && !newConfig->find("fsnameservers")) {
       return Error::vorn(kVornSanServerMissing).status();
     }
@@ -141,13 +145,32 @@ int checkSanConfigChangeWithServer(const std::string* server, std::uint32_t* cha
   }
 
   log("About to get new config");
-  std::optional<Value> fetched = getVornConfigForConfig(*choice.node, *working, &slot);
+  std::optional<FetchedConfiguration> record =
+      FetchedConfiguration::fetch(*choice.node, working->findString("sanName"), &slot);
+  if (!record) return codeOf(slot);
+
+  apply.working = working;
+  const std::string* applied = working->findString("sanRevision");
+  if (applied != nullptr) {
+    // Most checks end here: the revision is read from the globals alone,
+    // and the volumes, which make nearly all of a large configuration, are
+    // neither parsed nor logged.
+    if (std::optional<Value> globals = record->peekGlobals()) {
+      const std::string* revision = globals->findString("revision");
+      if (revision != nullptr && *revision == *applied) {
+        Value readPart;
+        readPart.set("globals", std::move(*globals));
+        log("Got config %@", redactVornSecrets(readPart));
+        if (newConfig == nullptr) return 0;
+        return saveUnchangedJoin(apply);
+      }
+    }
+  }
+  std::optional<Value> fetched = record->parse(&slot);
   if (!fetched) return codeOf(slot);
   log("Got config %@", redactVornSecrets(*fetched));
 
-  apply.working = working;
   const std::optional<std::string> revision = buildRevisionStringFromConfig(*fetched);
-  const std::string* applied = working->findString("sanRevision");
   if (applied != nullptr && revision && *applied == *revision) {
     if (newConfig == nullptr) return 0;
     return saveUnchangedJoin(apply);
@@ -159,7 +182,8 @@ int checkSanConfigChangeWithServer(const std::string* server, std::uint32_t* cha
   }
 
   Value* globals = fetched->find("globals");
-  if (globals == nullptr || !globals->isDictionary()) globals = &fetched->set("globals", Value::dictionary());
+  if (globals == nullptr || !globals->isDictionary())
+    globals = &fetched->set("globals", Value::dictionary());
   apply.globals = globals;
   apply.volumes = fetched->find("volumes");
   apply.usedNode = true;
