@@ -416,10 +416,17 @@ std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeNam
     setError(error, directoryError(LDAP_PARAM_ERROR, "not a directory node name"));
     return nullptr;
   }
-  // Opening contacts no server: a node whose certificates are not trusted
-  // yet must still take the custom call that trusts them.
-  return std::make_unique<LdapNode>(nodeName,
-                                    std::make_shared<LdapConnection>(env, std::move(*address)));
+  // Opening connects, reads the root DSE and, on ldapi, binds as the local
+  // superuser: a node that opens is one whose server answered.
+  auto connection = std::make_shared<LdapConnection>(env, std::move(*address));
+  {
+    std::lock_guard lock(connection->mutex());
+    if (auto e = connection->ready()) {
+      setError(error, std::move(*e));
+      return nullptr;
+    }
+  }
+  return std::make_unique<LdapNode>(nodeName, std::move(connection));
 }
 
 }  // namespace kolt
