@@ -225,7 +225,10 @@ void LdapConnection::becomeAnonymous() {
 std::optional<Error> LdapConnection::bindAsUser(const std::string& name,
                                                 const std::string& password) {
   if (auto e = ready()) return e;
-  if (auto e = startTlsIfRequired()) return e;
+  if (auto e = startTlsIfRequired()) {
+    becomeAnonymous();
+    return e;
+  }
   // The user lives under the first naming context that knows it.
   int rc = LDAP_INVALID_CREDENTIALS;
   for (const std::string& context : namingContexts_) {

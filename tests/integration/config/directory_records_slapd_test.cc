@@ -11,6 +11,7 @@
 #include <memory>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "fixtures/log_capture.h"
@@ -518,6 +519,95 @@ TEST_F(DirectoryRecordsSlapdTest, TheLocalSuperuserCreatesOverLdapi) {
   EXPECT_EQ(destroyVornConfig(*root, &san, &error), 0) << printed(error);
   EXPECT_EQ(culVornConfig(*root, &san, &error), 0) << printed(error);
   EXPECT_FALSE(storedBytes(san));
+}
+
+// The server going away half-way: each operation fails with the client's
+// error, passed on unchanged, and the same nodes work again once it is back.
+TEST_F(DirectoryRecordsSlapdTest, AServerRestartFailsTheStepAndTheNodesRecover) {
+  const std::string san = "Restarted", secret = "restarted-secret";
+  create(san, secret);
+  auto user = openSanUser(san, secret);
+  ASSERT_NE(user, nullptr);
+  Value config = stored(san);
+  ASSERT_TRUE(slapd_->stop());
+  ErrorSlot error;
+  EXPECT_EQ(saveVornConfig(*admin_, config, &san, true, &error), 1);
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->domain(), kDirectoryErrorDomain);
+  EXPECT_EQ(error->code(), -1) << printed(error);
+  error.reset();
+  EXPECT_FALSE(getVornConfig(*user, &san, &error));
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code(), -1) << printed(error);
+  error.reset();
+  EXPECT_EQ(destroyVornConfig(*admin_, &san, &error), 1);
+  EXPECT_EQ(error->code(), -1) << printed(error);
+  std::string startError;
+  ASSERT_TRUE(slapd_->restart(&startError)) << startError;
+
+  ASSERT_EQ(saveVornConfig(*admin_, config, &san, true, &error), 0) << printed(error);
+  EXPECT_EQ(getVornConfig(*user, &san, &error), config) << printed(error);
+  // The user is still only the SAN's user.
+  EXPECT_EQ(saveVornConfig(*user, config, &san, true, &error), 1);
+  EXPECT_EQ(error->code(), 50) << printed(error);
+}
+
+// SANs read and written at once from several threads, each with its own
+// node, and two threads sharing one: nothing crosses between them.
+TEST_F(DirectoryRecordsSlapdTest, ConcurrentReadersAndWritersStayApart) {
+  constexpr int kSans = 3, kRounds = 15;
+  for (int i = 0; i < kSans; ++i) create("Parallel " + std::to_string(i), "p-secret");
+  auto shared = openSanUser("Parallel 0", "p-secret");
+  ASSERT_NE(shared, nullptr);
+  std::vector<std::string> failures[kSans + 2];
+  std::vector<std::thread> threads;
+  for (int i = 0; i < kSans; ++i) {
+    threads.emplace_back([&, i] {
+      const std::string san = "Parallel " + std::to_string(i);
+      ErrorSlot error;
+      auto node = sandbox_.env().openDirectoryNode(ldapNode(), &error);
+      if (!node || !node->setCredentials(kRecordTypeUsers, slapd_->adminName(),
+                                         slapd_->adminPassword(), &error)) {
+        failures[i].push_back("open: " + printed(error));
+        return;
+      }
+      for (int round = 0; round < kRounds; ++round) {
+        std::optional<Value> config = getVornConfig(*node, &san, &error);
+        if (!config) {
+          failures[i].push_back("get: " + printed(error));
+          continue;
+        }
+        config->findDictionary("globals")->set("owner", san);
+        config->findDictionary("globals")->set("round", Value::integer(round));
+        if (saveVornConfig(*node, *config, &san, true, &error) != 0) {
+          failures[i].push_back("save: " + printed(error));
+        }
+      }
+    });
+  }
+  for (int reader = 0; reader < 2; ++reader) {
+    threads.emplace_back([&, reader] {
+      const std::string san = "Parallel 0";
+      for (int round = 0; round < kRounds; ++round) {
+        ErrorSlot error;
+        std::optional<Value> config = getVornConfig(*shared, &san, &error);
+        const std::string* owner = config ? config->find("globals")->findString("owner") : nullptr;
+        if (!config) {
+          failures[kSans + reader].push_back("shared get: " + printed(error));
+        } else if (owner != nullptr && *owner != san) {
+          failures[kSans + reader].push_back("read another SAN's record: " + *owner);
+        }
+      }
+    });
+  }
+  for (auto& t : threads) t.join();
+  for (const auto& list : failures) EXPECT_TRUE(list.empty()) << list.front();
+  for (int i = 0; i < kSans; ++i) {
+    const std::string san = "Parallel " + std::to_string(i);
+    const Value config = stored(san);
+    EXPECT_EQ(*config.find("globals")->findString("owner"), san);
+    EXPECT_EQ(*config.find("globals")->find("round"), Value::integer(kRounds - 1));
+  }
 }
 
 // A record kolt wrote, read by the SAN's user with the ldapsearch command
