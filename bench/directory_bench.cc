@@ -57,11 +57,30 @@ std::string uuidFor(int i) {
 
 // A volume as a controller publishes it: its parsed configuration (globals
 // and stripe groups with their disks), the file's date and its controllers.
+// A negative disk count gives the smallest volume: a few settings and one
+// stripe group of one disk.
 Value makeVolume(int index, int disks) {
+  const bool compact = disks < 0;
   Value globals = Value::dictionary();
   globals.set("fsBlockSize", Value::integer(16384));
   globals.set("journalSize", "16M");
   globals.set("allocationStrategy", "Round");
+  if (compact) {
+    Value group = Value::dictionary();
+    group.set("name", "All");
+    Value disk = Value::dictionary();
+    disk.set("name", "vol" + std::to_string(index) + "_d0");
+    disk.set("sectors", Value::integer(3907029168LL));
+    group.set("disks", kolt::Array{disk});
+    Value config = Value::dictionary();
+    config.set("globals", std::move(globals));
+    config.set("stripeGroups", kolt::Array{group});
+    Value volume = Value::dictionary();
+    volume.set("config", std::move(config));
+    volume.set("mtime", Value::date(7.5e8 + index));
+    volume.set("controllers", kolt::Array{Value(uuidFor(0))});
+    return volume;
+  }
   globals.set("bufferCacheSize", "64M");
   globals.set("inodeCacheSize", Value::integer(32768));
   globals.set("maxConnections", Value::integer(128));
@@ -153,10 +172,10 @@ Value makeConfig(const std::string& san, std::size_t target) {
   for (int disks = 24; xmlSize(config) < target; ++i) {
     const std::string name = "Volume" + std::to_string(i);
     volumes.set(name, makeVolume(i, disks));
-    while (xmlSize(config) > target + target / 8 && disks > 0) {
+    while (xmlSize(config) > target + target / 4 && disks >= 0) {
       volumes.set(name, makeVolume(i, --disks));
     }
-    if (xmlSize(config) > target + target / 8) {
+    if (xmlSize(config) > target + target / 4) {
       volumes.erase(name);
       break;
     }
