@@ -66,13 +66,14 @@ class KOLT_EXPORT Dictionary {
   // Removes `key`; returns whether it was present.
   bool erase(std::string_view key);
 
-  std::size_t size() const { return entries_.size(); }
-  bool empty() const { return entries_.empty(); }
+  // Defined after Value, which must be complete for them (clang insists).
+  std::size_t size() const;
+  bool empty() const;
   const_iterator begin() const { return entries_.begin(); }
   const_iterator end() const { return entries_.end(); }
   iterator begin() { return entries_.begin(); }
   iterator end() { return entries_.end(); }
-  void clear() { entries_.clear(); }
+  void clear();
 
   // Builds a dictionary from entries in any order; a later duplicate key
   // replaces an earlier one. Used by the readers.
@@ -174,30 +175,46 @@ class KOLT_EXPORT Value {
   std::variant<Dictionary, Array, std::string, Integer, double, Boolean, Date, Data> v_;
 };
 
+inline std::size_t Dictionary::size() const { return entries_.size(); }
+inline bool Dictionary::empty() const { return entries_.empty(); }
+inline void Dictionary::clear() { entries_.clear(); }
+
 // Limits that every reader enforces. A document that exceeds one is rejected
 // with an error; nothing partial is returned.
 struct ParseLimits {
-  std::size_t maxDepth = 512;  // nesting of containers
-  // Values produced (after expanding shared references in binary lists).
-  // 0 means: derived from the input size (at least 1 << 20).
+  // Nesting of containers. Values are copied, compared, printed and written
+  // recursively, so keep this in the hundreds or low thousands.
+  std::size_t maxDepth = 512;
+  // Values produced, dictionary keys included (after expanding shared
+  // references in binary lists). 0 means: the input size in bytes, at least
+  // 1 << 20.
   std::size_t maxObjects = 0;
-  // Bytes of string and data content produced. 0 means: derived from the
-  // input size (at least 64 MiB).
+  // Bytes of string, key and data content produced. 0 means: twice the input
+  // size, at least 64 MiB.
   std::size_t maxBytes = 0;
 };
 
-// Parses an XML ("<?xml", "<plist") or binary ("bplist00") property list.
+// Parses an XML or binary ("bplist00") property list. XML may begin with a
+// UTF-8 byte order mark and whitespace; a document type declaration is
+// accepted, entity declarations and processing instructions are not. Binary
+// lists may share objects (each reference is expanded by value) but not
+// contain themselves; UID, set and null objects are refused.
 // Returns the value, or nothing with `error` (POSIX 22, the reason as its
-// description) when the input is malformed, exceeds a limit, or holds text
-// that is not a value of the tag's kind ("12abc" is no integer).
+// description, with line and column for XML) when the input is malformed,
+// exceeds a limit, or holds text that is not a value of the tag's kind
+// ("12abc" is no integer, "yesterday" no date).
 KOLT_EXPORT std::optional<Value> parsePropertyList(std::string_view bytes,
                                                    std::optional<Error>* error = nullptr,
                                                    const ParseLimits& limits = {});
 
 // Writes `value` as an XML property list, format 1.0: the XML declaration,
 // <plist version="1.0">, tab indentation, sorted keys, no document type
-// declaration. Fails (POSIX 22) only for strings or keys holding characters
-// that XML 1.0 cannot carry.
+// declaration, a final newline. &, <, > and carriage returns are written as
+// references; reals in their shortest exact form; dates in whole seconds
+// (floored); data as base64 in lines of 76 characters. Fails (POSIX 22, the
+// reason as description) for strings or keys holding invalid UTF-8 or
+// characters XML 1.0 cannot carry (C0 controls other than tab and line feed,
+// U+FFFE, U+FFFF), and for dates that are not finite or beyond the calendar.
 KOLT_EXPORT std::optional<std::string> writeXmlPropertyList(const Value& value,
                                                             std::optional<Error>* error = nullptr);
 

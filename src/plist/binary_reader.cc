@@ -147,7 +147,11 @@ bool BinaryReader::header(std::uint64_t index, Header* h) {
         h->body = pos;
         return true;
       }
-      if (h->info == 0x0) return fail("null objects are not supported");
+      if (h->info == 0x0)
+        return fail("object " + std::to_string(index) + ": null objects are not supported");
+      if (h->info == 0xF) {
+        return fail("object " + std::to_string(index) + ": fill objects are not supported");
+      }
       return fail("object " + std::to_string(index) + ": unknown marker");
     case kInt:
       if (h->info > 4) return fail("object " + std::to_string(index) + ": bad integer size");

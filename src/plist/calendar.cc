@@ -111,7 +111,9 @@ std::optional<double> parseIso8601(std::string_view s) {
     ++pos;
     ++yearDigits;
   }
-  if (yearDigits < 4) return std::nullopt;
+  // Twelve digits would overflow the seconds; kMaxYear keeps them in range
+  // and still reads every date the writer can express.
+  if (yearDigits < 4 || year > kMaxYear) return std::nullopt;
   if (negative) year = -year;
   CivilTime t;
   t.year = year;

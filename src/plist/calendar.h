@@ -27,11 +27,19 @@ CivilTime civilFromSeconds(double secondsSince2001);
 // "YYYY-MM-DDTHH:MM:SSZ" (the XML form; fractions are dropped by flooring).
 std::string formatIso8601(double secondsSince2001);
 // Reads the XML form strictly: a four-digit year (optionally preceded by
-// "-" or with more digits), month, day, hour, minute and second with their
-// ranges checked, and a final "Z". Anything else is no date.
+// "-" or with more digits, up to kMaxYear), month, day, hour, minute and
+// second with their ranges checked, and a final "Z". Anything else is no
+// date.
 std::optional<double> parseIso8601(std::string_view text);
 // "YYYY-MM-DD HH:MM:SS +0000" (the printed form).
 std::string formatForDescription(double secondsSince2001);
+
+// The largest year (either side of year 0) that parseIso8601 accepts; about
+// 8.2e18 seconds from 2001, inside 64-bit arithmetic.
+inline constexpr std::int64_t kMaxYear = 260000000000;
+// The largest distance from 2001 in seconds that formatIso8601 is used for
+// (writers refuse dates beyond it): years of fewer digits than kMaxYear.
+inline constexpr double kMaxIso8601Seconds = 8.0e18;
 
 // Seconds between 1970-01-01 and 2001-01-01.
 inline constexpr std::int64_t kUnixEpochTo2001 = 978307200;

@@ -59,24 +59,37 @@ const char* tagName(Kind k) {
   return "<?>";
 }
 
+// The element's kind; called for every element, so it looks at the first
+// letter before comparing whole names.
 bool classify(const char* name, Kind* kind) {
-  struct Tag {
-    const char* name;
-    Kind kind;
+  auto is = [name](const char* tag, Kind k, Kind* out) {
+    if (std::strcmp(name, tag) != 0) return false;
+    *out = k;
+    return true;
   };
-  static constexpr Tag kTags[] = {
-      {"key", Kind::kKey},     {"string", Kind::kString}, {"integer", Kind::kInteger},
-      {"dict", Kind::kDict},   {"array", Kind::kArray},   {"true", Kind::kTrue},
-      {"false", Kind::kFalse}, {"real", Kind::kReal},     {"date", Kind::kDate},
-      {"data", Kind::kData},   {"plist", Kind::kPlist},
-  };
-  for (const Tag& t : kTags) {
-    if (std::strcmp(name, t.name) == 0) {
-      *kind = t.kind;
-      return true;
-    }
+  switch (name[0]) {
+    case 'k':
+      return is("key", Kind::kKey, kind);
+    case 's':
+      return is("string", Kind::kString, kind);
+    case 'i':
+      return is("integer", Kind::kInteger, kind);
+    case 'd':
+      return is("dict", Kind::kDict, kind) || is("date", Kind::kDate, kind) ||
+             is("data", Kind::kData, kind);
+    case 'a':
+      return is("array", Kind::kArray, kind);
+    case 't':
+      return is("true", Kind::kTrue, kind);
+    case 'f':
+      return is("false", Kind::kFalse, kind);
+    case 'r':
+      return is("real", Kind::kReal, kind);
+    case 'p':
+      return is("plist", Kind::kPlist, kind);
+    default:
+      return false;
   }
-  return false;
 }
 
 bool isContainer(Kind k) {

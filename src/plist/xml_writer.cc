@@ -5,6 +5,7 @@
 #include <array>
 #include <cmath>
 #include <cstdint>
+#include <cstring>
 
 #include "kolt/error.h"
 #include "kolt/plist.h"
@@ -78,12 +79,31 @@ class XmlWriter {
   std::string failure_;
 };
 
+// Whether any of the eight bytes in `w` is a control character, non-ASCII,
+// or one of & < > (bit tricks for "has a byte less than / equal to").
+bool wordNeedsCare(std::uint64_t w) {
+  constexpr std::uint64_t kOnes = 0x0101010101010101ull;
+  constexpr std::uint64_t kHigh = 0x8080808080808080ull;
+  auto hasZero = [](std::uint64_t x) { return (x - kOnes) & ~x & kHigh; };
+  const std::uint64_t below20 = (w - kOnes * 0x20) & ~w & kHigh;
+  return (below20 | (w & kHigh) | hasZero(w ^ (kOnes * '&')) | hasZero(w ^ (kOnes * '<')) |
+          hasZero(w ^ (kOnes * '>'))) != 0;
+}
+
 bool XmlWriter::text(std::string_view s, const char* what) {
   const auto* p = reinterpret_cast<const unsigned char*>(s.data());
   const std::size_t n = s.size();
   std::size_t run = 0;  // start of the bytes not yet copied
   std::size_t i = 0;
   while (i < n) {
+    if (i + 8 <= n) {
+      std::uint64_t w;
+      std::memcpy(&w, p + i, 8);
+      if (!wordNeedsCare(w)) {
+        i += 8;
+        continue;
+      }
+    }
     const std::uint8_t cls = kClasses[p[i]];
     if (cls == kPlain) {
       ++i;
@@ -177,9 +197,9 @@ bool XmlWriter::write(const Value& v, std::size_t depth) {
       return true;
     case Value::Type::kDate: {
       const double s = v.asDate()->seconds;
-      // The calendar holds about +-2.9e11 years; beyond that (or NaN) the
-      // text would name another date.
-      if (!std::isfinite(s) || std::fabs(s) >= 9.0e18) {
+      // Beyond the calendar's range (or NaN) the text would name another
+      // date, or one the reader refuses.
+      if (!std::isfinite(s) || std::fabs(s) >= calendar::kMaxIso8601Seconds) {
         failure_ = "a date lies outside the range XML dates can express";
         return false;
       }
@@ -201,7 +221,7 @@ bool XmlWriter::write(const Value& v, std::size_t depth) {
 
 std::optional<std::string> writeXmlPropertyList(const Value& value, std::optional<Error>* error) {
   std::string out;
-  out.reserve(4096);
+  out.reserve(4096);  // growing is cheaper than walking the tree twice
   out +=
       "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
       "<plist version=\"1.0\">\n";

@@ -1,5 +1,6 @@
 /* Every C-linkage header of kolt compiles as strict C99 on its own. */
 #include "kolt/constants.h"
+#include "kolt/controller_helpers.h"
 #include "kolt/export.h"
 #include "kolt/log.h"
 

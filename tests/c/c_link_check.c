@@ -3,6 +3,7 @@
 #include <string.h>
 
 #include "kolt/constants.h"
+#include "kolt/controller_helpers.h"
 #include "kolt/log.h"
 
 static int captured;
@@ -24,6 +25,14 @@ int main(void) {
   if (log_message(7, "from C") != '\n' || !captured) {
     fprintf(stderr, "log_message did not reach the handler\n");
     return 1;
+  }
+  {
+    /* The address lookup is callable from C; a NULL address is refused. */
+    char host[8] = "";
+    if (vorn_controller_from_ip(NULL, host, sizeof host) != 1) {
+      fprintf(stderr, "vorn_controller_from_ip accepted NULL\n");
+      return 1;
+    }
   }
   kolt_set_log_handler(NULL, NULL);
   return 0;

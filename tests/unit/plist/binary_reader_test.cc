@@ -119,7 +119,7 @@ TEST(BinaryReaderTest, RefusesUnsupportedObjects) {
       {B::marker(0xC, 0), "sets"},
       {B::marker(0xB, 0), "sets"},
       {std::string(1, '\0'), "null"},
-      {"\x0F", "unknown marker"},
+      {"\x0F", "fill objects"},
       {"\x07", "unknown marker"},
       {"\x70", "unknown marker"},
       {"\xF0", "unknown marker"},

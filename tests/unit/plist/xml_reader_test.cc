@@ -177,6 +177,8 @@ TEST(XmlReaderTest, RefusesContentOfTheWrongKind) {
       "<date>2024-01-01T00:00:00</date>",
       "<date>2024-01-01T00:00:00+01:00</date>",
       "<date></date>",
+      "<date>999999999999-01-01T00:00:00Z</date>",
+      "<date>-999999999999-01-01T00:00:00Z</date>",
       "<data>@@@@</data>",
       "<data>SGVsbG8=x</data>",
       "<data>S</data>",

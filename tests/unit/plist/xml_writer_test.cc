@@ -113,6 +113,16 @@ TEST(XmlWriterTest, EscapesMarkupAndCarriageReturns) {
   std::optional<Value> back = parsePropertyList(xml);
   ASSERT_TRUE(back);
   EXPECT_EQ(*back, doc);
+  // Markup after long plain runs, at every alignment.
+  for (std::size_t lead = 0; lead < 17; ++lead) {
+    const std::string text = std::string(lead, 'x') + "<&>\r" + std::string(lead, 'y') + "&";
+    const std::string out = write(Value(text));
+    EXPECT_NE(out.find("<string>" + std::string(lead, 'x') + "&lt;&amp;&gt;&#13;" +
+                       std::string(lead, 'y') + "&amp;</string>"),
+              std::string::npos)
+        << out;
+    EXPECT_EQ(*parsePropertyList(out)->asString(), text);
+  }
 }
 
 TEST(XmlWriterTest, RefusesWhatXmlCannotCarry) {
@@ -131,7 +141,15 @@ TEST(XmlWriterTest, RefusesWhatXmlCannotCarry) {
       "\xF4\x90\x80\x80",      // above U+10FFFF
       "\xF8\x88\x80\x80\x80",  // five bytes
   };
+  // Each alone, and after and between runs of plain text (the writer
+  // skips plain text a word at a time).
+  std::vector<std::string> cases;
   for (const std::string& s : bad) {
+    cases.push_back(s);
+    cases.push_back(std::string(13, 'p') + s);
+    cases.push_back(std::string(16, 'p') + s + std::string(9, 'q'));
+  }
+  for (const std::string& s : cases) {
     const std::string asString = writeFailure(Value(s));
     EXPECT_NE(asString.find("a string"), std::string::npos) << hex(s) << ": " << asString;
     Value dict = Value::dictionary();
@@ -148,6 +166,7 @@ TEST(XmlWriterTest, RefusesWhatXmlCannotCarry) {
   EXPECT_NE(writeFailure(Value::date(NAN)).find("date"), std::string::npos);
   EXPECT_NE(writeFailure(Value::date(INFINITY)).find("date"), std::string::npos);
   EXPECT_NE(writeFailure(Value::date(1e300)).find("date"), std::string::npos);
+  EXPECT_NE(writeFailure(Value::date(-8.0e18)).find("date"), std::string::npos);
 }
 
 TEST(XmlWriterTest, AcceptsTheWholeCharacterRange) {
@@ -172,7 +191,9 @@ TEST(XmlWriterTest, SampleRoundTripsExactly) {
 }
 
 TEST(XmlWriterTest, DatesRoundTripAtWholeSeconds) {
-  for (double s : {-3187296000.0, 3124137599.0, 0.0, -1.0, 1e10, -6.0e10, 123456789.75}) {
+  // 1900, 2100, year 1 BC and both ends of the range the writer accepts.
+  for (double s : {-3187296000.0, 3124137599.0, 0.0, -1.0, 1e10, -63200000000.0, 123456789.75,
+                   7.99e18, -7.99e18}) {
     std::optional<Value> back = parsePropertyList(write(Value::date(s)));
     ASSERT_TRUE(back) << s;
     EXPECT_EQ(back->asDate()->seconds, std::floor(s)) << s;

@@ -1,0 +1,251 @@
+#include "volumes/volume_collection.h"
+
+#include <cmath>
+#include <map>
+#include <set>
+
+#include "config/tool_paths.h"
+#include "kolt/constants.h"
+#include "kolt/controller_helpers.h"
+#include "kolt/env.h"
+#include "kolt/error.h"
+#include "kolt/local_config.h"
+#include "kolt/log.h"
+#include "volumes/volume_update.h"
+
+namespace kolt {
+namespace {
+
+// What the scan found of one hosted volume.
+struct FoundVolume {
+  std::optional<double> cfg, cfgx, cfgp;  // modification dates of the files found
+  std::optional<Value> volData;           // the parsed configuration
+};
+
+using FoundTable = std::map<std::string, FoundVolume>;
+
+std::string volumePath(const std::string& volume, const char* suffix) {
+  // The double slash is the system's own path format for these files.
+  return std::string(kVornDirectory) + "/" + volume + "." + suffix;
+}
+
+bool endsWith(const std::string& s, std::string_view suffix) {
+  return s.size() >= suffix.size() && s.compare(s.size() - suffix.size(), suffix.size(), suffix) == 0;
+}
+
+bool validUTF8(std::string_view s) {
+  std::size_t i = 0;
+  while (i < s.size()) {
+    const unsigned char c = static_cast<unsigned char>(s[i]);
+    std::size_t extra = 0;
+    std::uint32_t cp = 0;
+    if (c < 0x80) {
+      ++i;
+      continue;
+    } else if ((c & 0xE0) == 0xC0) {
+      extra = 1;
+      cp = c & 0x1F;
+    } else if ((c & 0xF0) == 0xE0) {
+      extra = 2;
+      cp = c & 0x0F;
+    } else if ((c & 0xF8) == 0xF0) {
+      extra = 3;
+      cp = c & 0x07;
+    } else {
+      return false;
+    }
+    if (i + extra >= s.size()) return false;
+    for (std::size_t k = 1; k <= extra; ++k) {
+      const unsigned char cc = static_cast<unsigned char>(s[i + k]);
+      if ((cc & 0xC0) != 0x80) return false;
+      cp = (cp << 6) | (cc & 0x3F);
+    }
+    if ((extra == 1 && cp < 0x80) || (extra == 2 && cp < 0x800) || (extra == 3 && cp < 0x10000) ||
+        cp > 0x10FFFF || (cp >= 0xD800 && cp <= 0xDFFF)) {
+      return false;
+    }
+    i += extra + 1;
+  }
+  return true;
+}
+
+// Step 1: the volume files of hosted volumes, with their dates.
+FoundTable scanVolumeFiles(Env& env) {
+  FoundTable table;
+  std::set<std::string> hosted;
+  for (const Value& name : getHostedVolumeList()) {
+    if (const std::string* s = name.asString()) hosted.insert(*s);
+  }
+  std::string directory;
+  int rc = env.resolvePath(kVornDirectory, &directory);
+  std::vector<DirectoryEntry> entries;
+  if (rc == 0) rc = env.listDirectory(directory, &entries);
+  for (const DirectoryEntry& entry : entries) {
+    const char* kind = endsWith(entry.name, ".cfg")    ? cfgSuffix
+                       : endsWith(entry.name, ".cfgx") ? cfgxSuffix
+                       : endsWith(entry.name, ".cfgp") ? cfgpSuffix
+                                                       : nullptr;
+    if (kind == nullptr) continue;
+    const std::string volume = entry.name.substr(0, entry.name.find('.'));
+    if (hosted.count(volume) == 0) {
+      log("Ignoring extraneous volume config %@.%@", volume, kind);
+      continue;
+    }
+    FoundVolume& found = table[volume];
+    if (kind == cfgSuffix) {
+      found.cfg = entry.modificationTime;
+    } else if (kind == cfgxSuffix) {
+      found.cfgx = entry.modificationTime;
+    } else {
+      found.cfgp = entry.modificationTime;
+    }
+  }
+  if (rc != 0) {
+    log("Error got error '%@' for url '%@'", Error::fromErrno(rc), std::string(kVornDirectory));
+  }
+  return table;
+}
+
+// Step 2 for one volume: converts its newer source into a ".cfgp". Returns
+// the error that ends the conversion pass, if any.
+std::optional<Error> convertVolume(Env& env, const std::string& volume, FoundVolume& found) {
+  if (!found.cfg && !found.cfgx) return std::nullopt;
+  const bool fromCfg = found.cfg && (!found.cfgx || *found.cfg >= *found.cfgx);
+  const double sourceDate = fromCfg ? *found.cfg : *found.cfgx;
+  // The ".cfgp" carries its source's date; compare at the precision a
+  // published date keeps.
+  if (found.cfgp && std::floor(*found.cfgp) >= std::floor(sourceDate)) return std::nullopt;
+
+  ProcessSpec spec;
+  spec.executable = std::string(kToolDirectory) + "pdcfgconvert";
+  spec.arguments = {"-n", volume, "-F", "plist"};
+  if (fromCfg) spec.arguments.push_back("-A");
+  spec.arguments.push_back(volumePath(volume, fromCfg ? cfgSuffix : cfgxSuffix));
+  spec.standardOutput = StreamSpec::pipe();
+  const std::string failure = "Error creating cfgp for volume " + volume;
+  ProcessResult result;
+  if (const int rc = env.runProcess(spec, /*wait=*/true, &result); rc != 0) {
+    return Error::fromErrno(rc, failure);
+  }
+  if (result.exitStatus != 0) return Error::posix(result.exitStatus, failure);
+  if (!validUTF8(result.output)) return std::nullopt;  // passed over silently
+
+  // Parse before writing, so that unreadable output never replaces a good
+  // ".cfgp".
+  ErrorSlot parseError;
+  std::optional<Value> parsed = parsePropertyList(result.output, &parseError);
+  if (!parsed) {
+    return Error::vorn(kVornVolumeConfigUnreadable,
+                       parseError && parseError->description() ? *parseError->description()
+                                                               : "unreadable converter output");
+  }
+  const std::string cfgpPath = volumePath(volume, cfgpSuffix);
+  if (const int rc = writeFileAtomically(env, cfgpPath, result.output, 0644); rc != 0) {
+    return Error::fromErrno(rc, "Unable to write " + cfgpPath);
+  }
+  if (const int rc = env.setModificationTime(cfgpPath, sourceDate); rc != 0) {
+    return Error::fromErrno(rc, "Unable to date " + cfgpPath);
+  }
+  found.volData = std::move(parsed);
+  found.cfgp = sourceDate;
+  if (fromCfg) {
+    env.removeFile(volumePath(volume, cfgSuffix));
+    env.removeFile(std::string(kVornDirectory) + "/" + volume + "-auxdata.plist");
+  } else {
+    env.removeFile(volumePath(volume, cfgxSuffix));
+  }
+  return std::nullopt;
+}
+
+// Step 3: the ".cfgp" content of volumes that were not converted.
+void loadVolume(Env& env, const std::string& volume, FoundVolume& found) {
+  if (found.volData) return;
+  std::string bytes;
+  if (env.readFile(volumePath(volume, cfgpSuffix), &bytes) != 0) return;
+  // An unreadable ".cfgp" leaves the volume without data; the merge passes
+  // it over.
+  found.volData = parsePropertyList(bytes);
+}
+
+bool containsString(const Array& a, const std::string& s) {
+  for (const Value& v : a) {
+    if (const std::string* t = v.asString(); t && *t == s) return true;
+  }
+  return false;
+}
+
+Array& controllersOf(Value& entry) {
+  Value* list = entry.find(controllersKey);
+  if (list == nullptr || !list->isArray()) list = &entry.set(controllersKey, Value::array());
+  return *list->asArray();
+}
+
+Value newVolumeEntry(const FoundVolume& found, const std::string& ourUUID) {
+  Value entry = Value::dictionary();
+  entry.set(configKey, *found.volData);
+  entry.set(mtimeKey, Value::date(*found.cfgp));
+  entry.set(controllersKey, Array{Value(ourUUID)});
+  return entry;
+}
+
+}  // namespace
+
+bool sameWholeSecond(double a, double b) { return std::floor(a) == std::floor(b); }
+
+void buildVolumeConfig(Value& volumes, int* changeFlags) {
+  Env& env = currentEnv();
+  if (!volumes.isDictionary()) volumes = Value::dictionary();
+  FoundTable table = scanVolumeFiles(env);
+
+  for (auto& [volume, found] : table) {
+    if (std::optional<Error> error = convertVolume(env, volume, found)) return;
+  }
+  for (auto& [volume, found] : table) loadVolume(env, volume, found);
+
+  std::set<std::string> unseen;
+  for (const auto& [name, entry] : *volumes.asDictionary()) unseen.insert(name);
+  const std::string& ourUUID = getOurUUID();
+  bool changed = false;
+
+  for (const auto& [volume, found] : table) {
+    const bool wasListed = unseen.erase(volume) > 0;
+    if (!found.volData || !found.cfgp) continue;  // nothing readable: the entry stays as it was
+    Value* entry = volumes.find(volume);
+    if (!wasListed || entry == nullptr || !entry->isDictionary()) {
+      volumes.set(volume, newVolumeEntry(found, ourUUID));
+      changed = true;
+      continue;
+    }
+    const Value* mtime = entry->find(mtimeKey);
+    const bool current = mtime && mtime->asDate() && sameWholeSecond(mtime->asDate()->seconds, *found.cfgp);
+    Array& controllers = controllersOf(*entry);
+    const bool hosted = containsString(controllers, ourUUID);
+    if (current && hosted) continue;
+    changed = true;
+    if (!hosted) controllers.push_back(Value(ourUUID));
+    if (!current) {
+      entry->set(configKey, *found.volData);
+      entry->set(mtimeKey, Value::date(*found.cfgp));
+    }
+  }
+
+  for (const std::string& volume : unseen) {
+    Value* entry = volumes.find(volume);
+    if (entry == nullptr || !entry->isDictionary()) continue;
+    Array& controllers = controllersOf(*entry);
+    if (*changeFlags & kBuildNewController) {
+      controllers.push_back(Value(ourUUID));
+    } else if (containsString(controllers, ourUUID)) {
+      std::erase_if(controllers, [&](const Value& v) {
+        const std::string* s = v.asString();
+        return s && *s == ourUUID;
+      });
+      changed = true;
+    }
+  }
+
+  if (changed) *changeFlags |= kBuildPublish;
+  if (*changeFlags & kBuildNewController) updateFromVolumeConfig(volumes);
+}
+
+}  // namespace kolt
