@@ -104,6 +104,13 @@ TEST_F(LdapDirectoryTest, LdapsVerifiesTheServerAgainstKoltsTrustStore) {
   EXPECT_EQ(error->domain(), kDirectoryErrorDomain);
   EXPECT_LT(error->code(), 0) << printed(error);
   EXPECT_EQ(error->printed().find(server().adminPassword()), std::string::npos);
+  // The untrusted node opens, but reads nothing from the server.
+  auto untrusted = sandbox.env().openDirectoryNode("/LDAPv3/" + server().ldapsUrl(), &error);
+  ASSERT_NE(untrusted, nullptr) << printed(error);
+  error.reset();
+  EXPECT_FALSE(untrusted->queryRecords(RecordType::kGroups, "x", Attribute::kXMLPlist, 1, &error));
+  ASSERT_TRUE(error.has_value());
+  EXPECT_LT(error->code(), 0) << printed(error);
 
   sandbox.trust(server().caCertificatePath());
   error.reset();
@@ -113,35 +120,27 @@ TEST_F(LdapDirectoryTest, LdapsVerifiesTheServerAgainstKoltsTrustStore) {
 
 TEST_F(LdapDirectoryTest, CustomCallTrustsTheServersCertificates) {
   const std::string ldaps = "/LDAPv3/" + server().ldapsUrl();
-  {
-    // An ldap:// node opens without trusting the server and takes the call
-    // over StartTLS; an ldaps:// node cannot be opened until then.
+  // Over TLS directly on an ldaps:// node, or StartTLS on an ldap:// one;
+  // both open before the server is trusted.
+  for (const std::string& url : {server().ldapsUrl(), server().ldapUrl()}) {
     Sandbox sandbox;
     ErrorSlot error;
-    EXPECT_EQ(sandbox.env().openDirectoryNode(ldaps, &error), nullptr);
+    auto node = sandbox.env().openDirectoryNode("/LDAPv3/" + url, &error);
+    ASSERT_NE(node, nullptr) << url << printed(error);
+    EXPECT_EQ(adminNode(sandbox, ldaps, &error), nullptr);
     ASSERT_TRUE(error.has_value());
     EXPECT_LT(error->code(), 0) << printed(error);
     error.reset();
-    auto node = sandbox.env().openDirectoryNode("/LDAPv3/" + server().ldapUrl(), &error);
-    ASSERT_NE(node, nullptr) << printed(error);
-    ASSERT_TRUE(node->customCall(kCustomCallClientAddCACerts, &error)) << printed(error);
-    EXPECT_EQ(sandbox.trustedFiles(), 1u);  // the CA, not the server's own certificate
-    EXPECT_NE(adminNode(sandbox, ldaps, &error), nullptr) << printed(error);
+    ASSERT_TRUE(node->customCall(kCustomCallClientAddCACerts, &error)) << url << printed(error);
+    EXPECT_EQ(sandbox.trustedFiles(), 1u) << url;  // the CA, not the server's own certificate
+    EXPECT_NE(adminNode(sandbox, ldaps, &error), nullptr) << url << printed(error);
+    // The node opened untrusted works now.
+    EXPECT_TRUE(node->setCredentials(kRecordTypeUsers, server().adminName(),
+                                     server().adminPassword(), &error))
+        << url << printed(error);
     // Doing it again changes nothing.
     EXPECT_TRUE(node->customCall(kCustomCallClientAddCACerts, &error));
     EXPECT_EQ(sandbox.trustedFiles(), 1u);
-  }
-  {
-    // Directly over TLS on an ldaps:// node (opened while trusted by hand).
-    Sandbox sandbox;
-    sandbox.trust(server().caCertificatePath());
-    ErrorSlot error;
-    auto node = sandbox.env().openDirectoryNode(ldaps, &error);
-    ASSERT_NE(node, nullptr) << printed(error);
-    fs::remove(sandbox.root() + std::string(kTrustStoreDirectory) + "/ca.pem");
-    ASSERT_TRUE(node->customCall(kCustomCallClientAddCACerts, &error)) << printed(error);
-    EXPECT_EQ(sandbox.trustedFiles(), 1u);
-    EXPECT_NE(adminNode(sandbox, ldaps, &error), nullptr) << printed(error);
   }
 }
 
