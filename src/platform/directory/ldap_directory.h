@@ -18,8 +18,9 @@ namespace kolt {
 // the server cannot be reached (-1 "Can't contact LDAP server") or fails
 // the TLS handshake. An ldaps:// server whose certificate is not trusted yet
 // opens (so that the custom call can trust it) but fails every other
-// operation with the TLS error until it is trusted. ldapi socket paths and kolt's
-// trust store are mapped below `env`'s root; `env` must outlive the node.
+// operation with the TLS error until it is trusted. ldapi socket paths and
+// kolt's trust store are mapped below `env`'s root; `env` must outlive the
+// node.
 std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeName,
                                             ErrorSlot* error);
 
