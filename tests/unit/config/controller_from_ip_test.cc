@@ -97,13 +97,5 @@ TEST_F(ControllerFromIpTest, LogsTheDocumentWithoutItsSecret) {
   EXPECT_FALSE(logs.contains("do-not-log-me"));
 }
 
-TEST_F(ControllerFromIpTest, RefusesNullArguments) {
-  char buffer[4];
-  EXPECT_EQ(vorn_controller_from_ip(nullptr, buffer, sizeof buffer), 1);
-  EXPECT_EQ(errno, EINVAL);
-  EXPECT_EQ(vorn_controller_from_ip("10.0.0.5", nullptr, 4), 1);
-  EXPECT_EQ(errno, EINVAL);
-}
-
 }  // namespace
 }  // namespace kolt

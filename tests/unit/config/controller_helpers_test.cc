@@ -79,15 +79,6 @@ TEST(MigrateComputers, KeepsComputersAtNameServerAddresses) {
   EXPECT_EQ(*fromDict.find("U3"), controller("10.0.0.3", "three"));
 }
 
-TEST(RevisionString, IsTheGlobalsRevision) {
-  Value config;
-  config.set("globals", Value(Dictionary()));
-  EXPECT_FALSE(buildRevisionStringFromConfig(config).has_value());
-  config.findDictionary("globals")->set("revision", "00000000-0000-0000-0000-000000000000");
-  EXPECT_EQ(buildRevisionStringFromConfig(config), "00000000-0000-0000-0000-000000000000");
-  EXPECT_FALSE(buildRevisionStringFromConfig(Value("text")).has_value());
-}
-
 TEST(RedactSecrets, HidesBothSecretsWithoutTouchingTheDocument) {
   const std::string secret = "s3cret-Shared-Key";
   Value document;

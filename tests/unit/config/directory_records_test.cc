@@ -102,7 +102,8 @@ TEST_F(DirectoryRecordsTest, SanUserReadsItsConfigurationButCannotWriteIt) {
   create();
   ErrorSlot error;
   auto member = directory_->openNode("/LDAPv3/127.0.0.1", &error);
-  ASSERT_TRUE(member->setCredentials(kRecordTypeUsers, ldapSanUserNameForName(kSan), kSecret, &error));
+  ASSERT_TRUE(
+      member->setCredentials(kRecordTypeUsers, ldapSanUserNameForName(kSan), kSecret, &error));
   std::optional<Value> config = getVornConfig(*member, &kSan, &error);
   ASSERT_TRUE(config);
   EXPECT_NE(saveVornConfig(*member, *config, &kSan, true, &error), 0);
@@ -125,10 +126,12 @@ TEST_F(DirectoryRecordsTest, GetReportsMissingAndUnreadableRecords) {
   EXPECT_FALSE(getVornConfig(*node_, &empty, &error));
   EXPECT_EQ(error->code(), kVornNoConfiguration);
 
-  for (const char* garbage : {"", "not a plist", "<plist version=\"1.0\"><string>x</string></plist>",
-                              "<plist version=\"1.0\"><dict><key>a</key></dict></plist>"}) {
+  for (const char* garbage :
+       {"", "not a plist", "<plist version=\"1.0\"><string>x</string></plist>",
+        "<plist version=\"1.0\"><dict><key>a</key></dict></plist>"}) {
     const std::string name = std::string("bad ") + garbage;
-    ASSERT_TRUE(directory_->addGroup(ldapSanConfNameForName(name), std::nullopt, std::string(garbage)));
+    ASSERT_TRUE(
+        directory_->addGroup(ldapSanConfNameForName(name), std::nullopt, std::string(garbage)));
     error.reset();
     EXPECT_FALSE(getVornConfig(*node_, &name, &error)) << garbage;
     ASSERT_TRUE(error) << garbage;
@@ -256,8 +259,8 @@ TEST_F(DirectoryRecordsTest, CreationFailuresStopAtTheFailingStep) {
       {DirectoryOperation::kSynchronize, 1, true, false, false},
       {DirectoryOperation::kChangePassword, 1, true, false, true},
       {DirectoryOperation::kCreateRecord, 2, true, false, false},
-      {DirectoryOperation::kSynchronize, 2, true, true, false},   // the user's second sync
-      {DirectoryOperation::kSynchronize, 3, true, true, false},   // the group's sync
+      {DirectoryOperation::kSynchronize, 2, true, true, false},  // the user's second sync
+      {DirectoryOperation::kSynchronize, 3, true, true, false},  // the group's sync
       {DirectoryOperation::kAddMember, 1, true, true, false},
   };
   for (const Case& c : cases) {
@@ -268,9 +271,12 @@ TEST_F(DirectoryRecordsTest, CreationFailuresStopAtTheFailingStep) {
     ErrorSlot error;
     EXPECT_EQ(createNewVornConfig(*node_, &kSan, &kSecret, &error), 1);
     EXPECT_EQ(error, injected);
-    EXPECT_EQ(directory_->hasRecord(RecordType::kUsers, ldapSanUserNameForName(kSan)), c.userRemains);
-    EXPECT_EQ(directory_->hasRecord(RecordType::kGroups, ldapSanConfNameForName(kSan)), c.groupRemains);
-    EXPECT_EQ(logs.countStartingWith("ChangePassword failed with error "), c.passwordLine ? 1u : 0u);
+    EXPECT_EQ(directory_->hasRecord(RecordType::kUsers, ldapSanUserNameForName(kSan)),
+              c.userRemains);
+    EXPECT_EQ(directory_->hasRecord(RecordType::kGroups, ldapSanConfNameForName(kSan)),
+              c.groupRemains);
+    EXPECT_EQ(logs.countStartingWith("ChangePassword failed with error "),
+              c.passwordLine ? 1u : 0u);
     EXPECT_FALSE(logs.contains(kSecret));
     // culVornConfig clears whatever creation left.
     directory_->clearFaults();

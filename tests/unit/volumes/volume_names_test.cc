@@ -31,9 +31,5 @@ TEST(VolumeNames, RejectsNamesThatLeaveTheDirectoryOrBreakALine) {
   }
 }
 
-TEST(VolumeNames, PrintableFormEscapesControlCharacters) {
-  EXPECT_EQ(printableVolumeName("a\nb\\c"), "a\\x0Ab\\x5Cc");
-}
-
 }  // namespace
 }  // namespace kolt
