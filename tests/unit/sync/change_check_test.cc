@@ -129,17 +129,16 @@ TEST_F(ChangeCheckTest, URLsGoServerFirstThenTheLocalDirectoryThenTheSansOwn) {
   LogCapture logs;
   const FileSnapshot before = files();
 
-  // Every server is down: the last node that opened is still asked.
+  // Every server is down: no node opens, and the last error ends the check.
   EXPECT_EQ(check(nullptr, &server), -1);
 
   EXPECT_EQ(
       recorder().openedNodes,
       (std::vector<std::string>{"/LDAPv3/ldaps://" + server, kLocalNode,
                                 "/LDAPv3/" + std::string(kUrl1), "/LDAPv3/" + std::string(kUrl2)}));
-  // A down server fails its node's opening or its bind; either is logged.
-  EXPECT_EQ(logs.countStartingWith("Set Cred returned ") +
-                logs.countStartingWith("Unable to contact node "),
-            4u);
+  EXPECT_EQ(logs.countStartingWith("Unable to contact node "), 4u);
+  EXPECT_TRUE(logs.contains("Unable to contact node ldaps://" + server));
+  EXPECT_TRUE(logs.contains("NodeChecking hated all of it"));
   EXPECT_EQ(mask_, 0u);
   EXPECT_TRUE(differences(before, files()).empty());
 
@@ -163,14 +162,14 @@ TEST_F(ChangeCheckTest, AFailingURLIsLoggedAndTheNextOneServes) {
     EXPECT_EQ(*loadConfigPlist()->findString("sanRevision"), kRevision2);
   }
   {
-    // The first server is down.
+    // The first server opens but refuses the bind.
     publishConfig(publishedConfig(stringArray({kUrl1, kUrl2}), kRevision1));
-    directory_->setReachable("/LDAPv3/" + std::string(kUrl1), false);
+    directory_->failOperation(DirectoryOperation::kSetCredentials, 1,
+                              Error(std::string(kDirectoryErrorDomain), 49, "Invalid credentials"));
     LogCapture logs;
     EXPECT_EQ(check(), 0);
-    EXPECT_EQ(logs.countStartingWith("Set Cred returned ") +
-                  logs.countStartingWith("Unable to contact node "),
-              1u);
+    EXPECT_EQ(logs.countStartingWith("Set Cred returned "), 1u);
+    EXPECT_FALSE(logs.contains("Unable to contact node"));
     EXPECT_EQ(*loadConfigPlist()->findString("sanRevision"), kRevision1);
   }
 }
