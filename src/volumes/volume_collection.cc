@@ -69,7 +69,8 @@ std::optional<FoundTable> scanVolumeFiles(Env& env) {
     }
   }
   if (rc != 0) {
-    log("Error got error '%@' for url '%@'", Error::fromErrno(rc), std::string(kVornDirectory));
+    log("Error got error '%@' for url '%@'", Error::fromErrno(rc),
+        "file://" + std::string(kVornDirectory));
     return std::nullopt;
   }
   return table;

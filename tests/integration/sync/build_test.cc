@@ -185,6 +185,8 @@ TEST_F(BuildOnSlapdTest, ControllerPublishesAndAMemberAppliesExactlyThat) {
   EXPECT_EQ(client_.sandbox.readFile(kVorn + "fsnameservers"), "10.1.2.3\n");
   EXPECT_EQ(client_.sandbox.readFile(kVorn + "fsports"), "MinPort 2000\n");
   expectVolumesAsPublished(client_, kUUIDClient, record);
+  // The volume update asks qmadmin to start each volume missing from fsmlist.
+  EXPECT_EQ(client_.sandbox.waitForToolCalls(2).size(), 2u);
 
   // The controller's own check finds its revision and changes nothing.
   mask = 0;

@@ -353,6 +353,7 @@ TEST_F(VolumeCollectionTest, NewControllerWithoutFilesMarksNoChangeOfItsOwn) {
   volumes.set("Remote", entry(markerConfig("remote"), kNine, {kOtherUUID}));
   EXPECT_EQ(collect(volumes, kBuildNewController), kBuildNewController);
   EXPECT_EQ(controllersOf(volumes, "Remote"), (std::vector<std::string>{kOtherUUID, kOurUUID}));
+  EXPECT_EQ(sandbox_.waitForToolCalls(1).size(), 1u);  // qmadmin starts Remote
 }
 
 TEST_F(VolumeCollectionTest, ListingFailureLeavesTheVolumesAlone) {
@@ -374,7 +375,7 @@ TEST_F(VolumeCollectionTest, ListingFailureLeavesTheVolumesAlone) {
 
   EXPECT_TRUE(volumes == before);
   EXPECT_TRUE(logs_.contains("Error got error '"));
-  EXPECT_TRUE(logs_.contains("' for url '/Library/Preferences/Vorn/'"));
+  EXPECT_TRUE(logs_.contains("' for url 'file:///Library/Preferences/Vorn/'"));
 }
 
 // --- Merge ------------------------------------------------------------------
