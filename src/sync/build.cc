@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <utility>
 
 #include "config/uuid_text.h"
 #include "kolt/controller_helpers.h"
@@ -22,6 +23,9 @@ namespace kolt {
 namespace {
 
 // The settings a controller publishes from its local document, in order.
+// What redactVornSecrets shows in place of the shared secret.
+constexpr const char* kRedactedSecret = "********";
+
 constexpr const char* kPublishedKeys[] = {"sanConfigURLs", "desiredSearchPolicy", "notifications",
                                           "ownerEmail",    "ownerName",           "sanAuthMethod"};
 
@@ -54,6 +58,21 @@ Value& volumesOf(Value& record) {
 
 bool startsWith(const std::string& s, std::string_view prefix) {
   return s.compare(0, prefix.size(), prefix) == 0;
+}
+
+// Logs `format` with the record as redactVornSecrets prints it, without
+// copying the record (it holds every volume's configuration): the secret is
+// masked in place for the line and put back.
+void logRedacted(const char* format, Value& record) {
+  std::optional<Value> topSecret, globalSecret;
+  Value* globals = record.find("globals");
+  if (Value* s = record.find("sharedSecret")) topSecret = std::exchange(*s, Value(kRedactedSecret));
+  if (Value* s = globals ? globals->find("sharedSecret") : nullptr) {
+    globalSecret = std::exchange(*s, Value(kRedactedSecret));
+  }
+  log(format, record);
+  if (topSecret) *record.find("sharedSecret") = std::move(*topSecret);
+  if (globalSecret) *globals->find("sharedSecret") = std::move(*globalSecret);
 }
 
 // Creates the SAN's records with the text of ".auth_secret" as the secret.
@@ -130,8 +149,11 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
     }
     if (std::optional<Error> error = createRecords(*directory, *local)) return error;
   }
-  log("buildSanConfig step 4 with %@",
-      record ? std::optional<Value>(redactVornSecrets(*record)) : std::nullopt);
+  if (record) {
+    logRedacted("buildSanConfig step 4 with %@", *record);
+  } else {
+    log("buildSanConfig step 4 with %@", std::optional<Value>());
+  }
 
   const std::string* sanNameValue = local->findString("sanName");
   const std::string sanName = sanNameValue ? *sanNameValue : std::string();
@@ -242,7 +264,7 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
 
   const bool hadAliasFile = applyAliasFile(*record, ourUUID, &flags);
 
-  log("buildSanConfig saving config %@", redactVornSecrets(*record));
+  logRedacted("buildSanConfig saving config %@", *record);
   slot.reset();
   if (flags != 0 && saveVornConfig(*directory, *record, &sanName, true, &slot) != 0) {
     return orFallback(std::move(slot), "Unable to save the SAN configuration");

@@ -146,7 +146,8 @@ std::optional<Error> convertVolume(Env& env, const std::string& volume, FoundVol
   return std::nullopt;
 }
 
-// Step 3: the ".cfgp" content of volumes that were not converted.
+// Step 3, done in the merge for the volumes whose entry needs it: the
+// ".cfgp" content of a volume that was not converted.
 void loadVolume(Env& env, const std::string& volume, FoundVolume& found) {
   if (found.volData) return;
   std::string bytes;
@@ -200,32 +201,35 @@ void buildVolumeConfig(Value& volumes, int* changeFlags) {
       return;
     }
   }
-  for (auto& [volume, found] : table) loadVolume(env, volume, found);
-
   std::set<std::string> unseen;
   for (const auto& [name, entry] : *volumes.asDictionary()) unseen.insert(name);
   const std::string& ourUUID = getOurUUID();
   bool changed = false;
 
-  for (const auto& [volume, found] : table) {
+  for (auto& [volume, found] : table) {
     const bool wasListed = unseen.erase(volume) > 0;
+    Value* entry = wasListed ? volumes.find(volume) : nullptr;
+    if (entry != nullptr && !entry->isDictionary()) entry = nullptr;
+    bool current = false, hosted = false;
+    if (entry != nullptr && found.cfgp) {
+      const Value* mtime = entry->find(mtimeKey);
+      current = mtime && mtime->asDate() && sameWholeSecond(mtime->asDate()->seconds, *found.cfgp);
+      const Array* controllers = entry->findArray(controllersKey);
+      hosted = controllers && containsString(*controllers, ourUUID);
+      // A current entry that names this controller needs nothing from the
+      // file, which is then not even read: the common case of a build.
+      if (current && hosted) continue;
+    }
+    loadVolume(env, volume, found);
     if (!found.volData || !found.cfgp) continue;  // nothing readable: the entry stays as it was
-    Value* entry = volumes.find(volume);
-    if (!wasListed || entry == nullptr || !entry->isDictionary()) {
+    changed = true;
+    if (entry == nullptr) {
       volumes.set(volume, newVolumeEntry(found, ourUUID));
-      changed = true;
       continue;
     }
-    const Value* mtime = entry->find(mtimeKey);
-    const bool current =
-        mtime && mtime->asDate() && sameWholeSecond(mtime->asDate()->seconds, *found.cfgp);
-    Array& controllers = controllersOf(*entry);
-    const bool hosted = containsString(controllers, ourUUID);
-    if (current && hosted) continue;
-    changed = true;
-    if (!hosted) controllers.push_back(Value(ourUUID));
+    if (!hosted) controllersOf(*entry).push_back(Value(ourUUID));
     if (!current) {
-      entry->set(configKey, *found.volData);
+      entry->set(configKey, std::move(*found.volData));
       entry->set(mtimeKey, Value::date(*found.cfgp));
     }
   }
