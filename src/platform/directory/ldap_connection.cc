@@ -1,5 +1,6 @@
 #include "platform/directory/ldap_connection.h"
 
+#include <poll.h>
 #include <string.h>
 #include <unistd.h>
 
@@ -84,33 +85,41 @@ std::optional<Error> LdapConnection::connect() {
   ldap_set_option(ld_, LDAP_OPT_RESTART, LDAP_OPT_ON);
   ldap_set_option(ld_, LDAP_OPT_NETWORK_TIMEOUT, &network);
   ldap_set_option(ld_, LDAP_OPT_TIMEOUT, &operation);
-  if (address_.scheme != LdapScheme::kLdapi) {
-    // Verify the server against the system's trust store and kolt's own.
-    const int demand = LDAP_OPT_X_TLS_DEMAND;
-    ldap_set_option(ld_, LDAP_OPT_X_TLS_REQUIRE_CERT, &demand);
-    const std::string bundle(kSystemTrustBundle);
-    if (::access(bundle.c_str(), R_OK) == 0) {
-      ldap_set_option(ld_, LDAP_OPT_X_TLS_CACERTFILE, bundle.c_str());
-    }
-    FileInfo info;
-    const std::string trustDir(kTrustStoreDirectory);
-    if (env_.fileInfo(trustDir, &info) == 0 && info.isDirectory) {
-      const std::string hostDir = env_.hostPath(trustDir);
-      ldap_set_option(ld_, LDAP_OPT_X_TLS_CACERTDIR, hostDir.c_str());
-    }
-    const int newContext = 0;
-    if (const int rc = ldap_set_option(ld_, LDAP_OPT_X_TLS_NEWCTX, &newContext);
-        rc != LDAP_OPT_SUCCESS) {
-      return error(rc);
-    }
+  if (address_.scheme == LdapScheme::kLdaps) {
+    if (auto e = configureTls()) return e;
   }
   if (const int rc = ldap_connect(ld_); rc != LDAP_SUCCESS) return error(rc);
   tls_ = address_.scheme == LdapScheme::kLdaps;
   return std::nullopt;
 }
 
+// Verifies the server against the system's trust store and kolt's own. Only
+// for a connection that uses TLS: loading the system's trust store costs
+// more than a whole exchange with a server on this machine.
+std::optional<Error> LdapConnection::configureTls() {
+  const int demand = LDAP_OPT_X_TLS_DEMAND;
+  ldap_set_option(ld_, LDAP_OPT_X_TLS_REQUIRE_CERT, &demand);
+  const std::string bundle(kSystemTrustBundle);
+  if (::access(bundle.c_str(), R_OK) == 0) {
+    ldap_set_option(ld_, LDAP_OPT_X_TLS_CACERTFILE, bundle.c_str());
+  }
+  FileInfo info;
+  const std::string trustDir(kTrustStoreDirectory);
+  if (env_.fileInfo(trustDir, &info) == 0 && info.isDirectory) {
+    const std::string hostDir = env_.hostPath(trustDir);
+    ldap_set_option(ld_, LDAP_OPT_X_TLS_CACERTDIR, hostDir.c_str());
+  }
+  const int newContext = 0;
+  if (const int rc = ldap_set_option(ld_, LDAP_OPT_X_TLS_NEWCTX, &newContext);
+      rc != LDAP_OPT_SUCCESS) {
+    return error(rc);
+  }
+  return std::nullopt;
+}
+
 std::optional<Error> LdapConnection::startTlsIfRequired() {
   if (tls_ || !startTlsRequiredBeforeBind(address_)) return std::nullopt;
+  if (auto e = configureTls()) return e;
   if (const int rc = ldap_start_tls_s(ld_, nullptr, nullptr); rc != LDAP_SUCCESS) {
     Error e = error(rc);
     return directoryError(static_cast<int>(e.code()),
@@ -174,7 +183,17 @@ int LdapConnection::simpleBind(const std::string& dn, const std::string& passwor
                           nullptr);
 }
 
+// True when the server closed the kept connection since its last use (it
+// stopped or restarted): its half of the connection is shut down.
+bool LdapConnection::closedByServer() const {
+  int fd = -1;
+  if (ldap_get_option(ld_, LDAP_OPT_DESC, &fd) != LDAP_OPT_SUCCESS || fd < 0) return true;
+  pollfd p{fd, POLLRDHUP, 0};
+  return ::poll(&p, 1, 0) > 0 && (p.revents & (POLLRDHUP | POLLHUP | POLLERR | POLLNVAL)) != 0;
+}
+
 std::optional<Error> LdapConnection::ready() {
+  if (ld_ != nullptr && closedByServer()) drop();
   if (ld_ != nullptr) return std::nullopt;
   if (auto e = connect()) return e;
   if (auto e = readNamingContexts()) return e;
@@ -192,20 +211,24 @@ std::optional<Error> LdapConnection::ready() {
   return std::nullopt;
 }
 
-std::optional<Error> LdapConnection::setCredentials(const std::string& name,
-                                                    const std::string& password) {
-  // Whatever happens, the session is no longer the previous user's.
-  userName_.reset();
-  external_ = false;
-  explicit_bzero(password_.data(), password_.size());
-  password_.clear();
-  drop();
-  // An empty password would make an unauthenticated bind, which succeeds
-  // as anonymous: refuse it as a wrong password.
-  if (password.empty()) return directoryError(LDAP_INVALID_CREDENTIALS, "empty password");
-  if (auto e = connect()) return e;
-  if (auto e = readNamingContexts()) return e;
-  if (auto e = startTlsIfRequired()) return e;
+// Ends whatever identity the session had; a connection that cannot be made
+// anonymous is dropped (the next operation connects anew, anonymously).
+void LdapConnection::becomeAnonymous() {
+  if (ld_ == nullptr) return;
+  berval none{0, nullptr};
+  if (ldap_sasl_bind_s(ld_, nullptr, LDAP_SASL_SIMPLE, &none, nullptr, nullptr, nullptr) !=
+      LDAP_SUCCESS) {
+    drop();
+  }
+}
+
+std::optional<Error> LdapConnection::bindAsUser(const std::string& name,
+                                                const std::string& password) {
+  if (auto e = ready()) return e;
+  if (auto e = startTlsIfRequired()) {
+    becomeAnonymous();
+    return e;
+  }
   // The user lives under the first naming context that knows it.
   int rc = LDAP_INVALID_CREDENTIALS;
   for (const std::string& context : namingContexts_) {
@@ -213,16 +236,27 @@ std::optional<Error> LdapConnection::setCredentials(const std::string& name,
     rc = simpleBind(recordDn(RecordType::kUsers, name), password);
     if (rc != LDAP_INVALID_CREDENTIALS) break;
   }
-  if (rc != LDAP_SUCCESS) {
-    Error e = error(rc);
-    // The session stays connected but anonymous.
-    base_ = namingContexts_.empty() ? std::string() : namingContexts_[0];
-    if (ld_ != nullptr) {
-      berval none{0, nullptr};
-      ldap_sasl_bind_s(ld_, nullptr, LDAP_SASL_SIMPLE, &none, nullptr, nullptr, nullptr);
-    }
-    return e;
+  if (rc == LDAP_SUCCESS) return std::nullopt;
+  Error e = error(rc);
+  base_ = namingContexts_.empty() ? std::string() : namingContexts_[0];
+  becomeAnonymous();
+  return e;
+}
+
+std::optional<Error> LdapConnection::setCredentials(const std::string& name,
+                                                    const std::string& password) {
+  // Whatever happens, the session is no longer the previous user's.
+  userName_.reset();
+  external_ = false;
+  explicit_bzero(password_.data(), password_.size());
+  password_.clear();
+  // An empty password would make an unauthenticated bind, which succeeds
+  // as anonymous: refuse it as a wrong password.
+  if (password.empty()) {
+    becomeAnonymous();
+    return directoryError(LDAP_INVALID_CREDENTIALS, "empty password");
   }
+  if (auto e = bindAsUser(name, password)) return e;
   baseConfirmed_ = true;
   userName_ = name;
   password_ = password;

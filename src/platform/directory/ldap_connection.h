@@ -33,15 +33,19 @@ class LdapConnection {
   Env& env() { return env_; }
   const NodeAddress& address() const { return address_; }
 
-  // Connects when not connected (again after a lost connection), binds as
-  // the session's credentials (none, SASL EXTERNAL on ldapi, or the user
-  // set by setCredentials) and finds the search base.
+  // Connects when not connected (at the node's opening, and again after a
+  // lost connection), binds as the session's credentials (none, SASL
+  // EXTERNAL on ldapi, or the user set by setCredentials) and finds the
+  // search base. The connection is kept for every later operation; one that
+  // the server closed since its last use (a restart) is noticed before the
+  // next operation, which then connects again.
   std::optional<Error> ready();
   LDAP* handle() { return ld_; }
   const std::string& base() const { return base_; }
 
-  // Simple bind as the user record `name`; see DirectoryNode. A failure
-  // leaves the session anonymous.
+  // Simple bind as the user record `name` on the kept connection (after
+  // StartTLS where the transport rule asks for it); see DirectoryNode. A
+  // failure leaves the session anonymous.
   std::optional<Error> setCredentials(const std::string& name, const std::string& password);
 
   // The error for result code `rc` of the last operation, with the
@@ -55,7 +59,11 @@ class LdapConnection {
 
  private:
   std::optional<Error> connect();
+  std::optional<Error> configureTls();
   std::optional<Error> startTlsIfRequired();
+  std::optional<Error> bindAsUser(const std::string& name, const std::string& password);
+  void becomeAnonymous();
+  bool closedByServer() const;
   std::optional<Error> readNamingContexts();
   int simpleBind(const std::string& dn, const std::string& password);
   void chooseBaseByProbing();

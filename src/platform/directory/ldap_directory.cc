@@ -416,10 +416,25 @@ std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeNam
     setError(error, directoryError(LDAP_PARAM_ERROR, "not a directory node name"));
     return nullptr;
   }
-  // Opening contacts no server: a node whose certificates are not trusted
-  // yet must still take the custom call that trusts them.
-  return std::make_unique<LdapNode>(nodeName,
-                                    std::make_shared<LdapConnection>(env, std::move(*address)));
+  // Opening connects, reads the root DSE and, on ldapi, binds as the local
+  // superuser: a node that opens is one whose server answered.
+  const bool ldaps = address->scheme == LdapScheme::kLdaps;
+  auto connection = std::make_shared<LdapConnection>(env, *address);
+  {
+    std::lock_guard lock(connection->mutex());
+    if (auto e = connection->ready()) {
+      // An ldaps server whose certificate is not trusted yet still answers a
+      // handshake that does not verify it. Its node opens, so that the
+      // custom call can trust it; every other operation fails with the TLS
+      // error until then, and nothing is read from or sent to it.
+      std::vector<std::string> presented;
+      if (!ldaps || fetchServerCaCertificates(*address, kLdapConnectTimeoutSeconds, &presented)) {
+        setError(error, std::move(*e));
+        return nullptr;
+      }
+    }
+  }
+  return std::make_unique<LdapNode>(nodeName, std::move(connection));
 }
 
 }  // namespace kolt

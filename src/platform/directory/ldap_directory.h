@@ -11,9 +11,16 @@
 
 namespace kolt {
 
-// A node over LDAP (libldap). Opening only checks the name (-9 when it is
-// no node name); the first operation connects. ldapi socket paths and kolt's
-// trust store are mapped below `env`'s root; `env` must outlive the node.
+// A node over LDAP (libldap). Opening connects to the server and reads its
+// root DSE (on ldapi it also binds as the local superuser); the connection
+// is kept for the node's operations. Fails with -9 when the name is no node
+// name (or its ldapi socket path is too long), with the client's code when
+// the server cannot be reached (-1 "Can't contact LDAP server") or fails
+// the TLS handshake. An ldaps:// server whose certificate is not trusted yet
+// opens (so that the custom call can trust it) but fails every other
+// operation with the TLS error until it is trusted. ldapi socket paths and
+// kolt's trust store are mapped below `env`'s root; `env` must outlive the
+// node.
 std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeName,
                                             ErrorSlot* error);
 

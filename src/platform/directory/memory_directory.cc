@@ -427,9 +427,9 @@ std::unique_ptr<DirectoryNode> MemoryDirectory::openNode(const std::string& node
   auto session = std::make_shared<Session>();
   session->nodeName = nodeName;
   if (address) session->address = *address;
-  // Like the LDAP client, opening contacts no server: an unreachable one
-  // fails the first operation that needs it.
-  if (auto e = enterLocked(DirectoryOperation::kOpenNode, nullptr)) {
+  // Like the LDAP client, opening contacts the server: an unreachable one
+  // fails here.
+  if (auto e = enterLocked(DirectoryOperation::kOpenNode, address ? session.get() : nullptr)) {
     setError(error, std::move(*e));
     return nullptr;
   }

@@ -61,7 +61,7 @@ class MemoryDirectory : public std::enable_shared_from_this<MemoryDirectory> {
   // Opens a node ("/LDAPv3/" + URL or host, parsed like the LDAP client).
   // The session starts anonymous, or as the local superuser on ldapi://.
   // Error -9 for a name that is no node; like the LDAP client, opening
-  // contacts no server.
+  // contacts the server: -1 when it is unreachable (setReachable).
   std::unique_ptr<DirectoryNode> openNode(const std::string& nodeName, ErrorSlot* error);
 
   // --- Setting up, without access checks ------------------------------------
@@ -93,8 +93,10 @@ class MemoryDirectory : public std::enable_shared_from_this<MemoryDirectory> {
   void clearFaults();
   // How many calls of `operation` were made (failed ones included).
   std::size_t callCount(DirectoryOperation operation) const;
-  // Makes the server of `nodeName` unreachable (every call on its nodes
-  // fails with -1 "Can't contact LDAP server") or reachable again.
+  // Makes the server of `nodeName` unreachable (opening a node on it, and
+  // every call on its open nodes, fails with -1 "Can't contact LDAP
+  // server") or reachable again; open nodes then work again, as LDAP nodes
+  // connect again.
   void setReachable(const std::string& nodeName, bool reachable);
 
   // The name as the directory compares it (see above).

@@ -91,11 +91,16 @@ TEST_F(MemoryDirectoryTest, PersistentFaultsAndClearing) {
   EXPECT_TRUE(node->queryRecords(RecordType::kUsers, "admin", Attribute::kXMLPlist, 1, nullptr));
 }
 
-TEST_F(MemoryDirectoryTest, UnreachableServersFailEveryCallUntilBack) {
+TEST_F(MemoryDirectoryTest, UnreachableServersFailOpeningAndEveryCallUntilBack) {
   auto node = openAdmin();
   dir->setReachable("/LDAPv3/ldap://127.0.0.1:389", false);
   ErrorSlot error;
   EXPECT_FALSE(node->queryRecords(RecordType::kUsers, "admin", Attribute::kXMLPlist, 1, &error));
+  EXPECT_EQ(error->code(), -1);
+  // Opening contacts the server, as an LDAP node does.
+  error.reset();
+  EXPECT_EQ(dir->openNode("/LDAPv3/127.0.0.1", &error), nullptr);
+  ASSERT_TRUE(error.has_value());
   EXPECT_EQ(error->code(), -1);
   // Another server of the same directory is still reachable.
   auto other = dir->openNode("/LDAPv3/ldaps://127.0.0.1", nullptr);
