@@ -447,7 +447,12 @@ void Demo::join(Machine& client) {
   report_.line("fsnameservers", servers + "  (from the published name servers)");
   report_.check(client.readFile("fsnameservers") == std::string("10.0.5.11\n"),
                 "fsnameservers 10.0.5.11");
-  report_.line("controllers", "controllerIPMap " + field(doc, "controllerIPMap"));
+  std::vector<std::string> map;
+  if (const Dictionary* entries = doc ? doc->findDictionary("controllerIPMap") : nullptr) {
+    for (const auto& [address, host] : *entries) map.push_back(address + " -> " + text(&host));
+  }
+  report_.line("controllers",
+               "controllerIPMap " + joined(map) + " (from the published controllers)");
   report_.line("fsmlist", fsmlistText(client));
   client.waitForToolRuns(2);
   report_.line("tools started", joined(client.newToolRuns(), "\n") +

@@ -594,23 +594,5 @@ TEST_F(BuildTest, CFFormHandsOutTheSameErrorObject) {
   EXPECT_EQ(a->domain(), kPosixErrorDomain);
 }
 
-TEST(DeleteControllerByUUIDTest, RemovesTheControllerAndEveryListingOfIt) {
-  Value record = recordOfAnotherController();
-  Value& g = *record.find("globals");
-  g.find("controllers")->set(kOurUUID, controllerEntry("ctrl-a", "10.1.2.3"));
-  Value& volumes = *record.find("volumes");
-  volumes.find("Archive")->set("controllers",
-                               Value(Array{Value(kOtherUUID), Value(kOurUUID), Value(kOtherUUID)}));
-  volumes.set("Odd", Value("not an entry"));
-
-  deleteControllerByUUID(g, volumes, kOtherUUID);
-
-  EXPECT_TRUE(*g.find("controllers") ==
-              Value(Dictionary::fromEntries({{kOurUUID, controllerEntry("ctrl-a", "10.1.2.3")}})));
-  EXPECT_TRUE(*volumes.find("Archive")->find("controllers") == Value(Array{Value(kOurUUID)}));
-  EXPECT_TRUE(*volumes.find("Scratch")->find("controllers") == Value(Array()));
-  EXPECT_TRUE(*volumes.find("Odd") == Value("not an entry"));
-}
-
 }  // namespace
 }  // namespace kolt
