@@ -36,7 +36,10 @@ namespace kolt {
 // 22 "System is not a controller", 500 "San has been deleted", 22 "Unable to
 // determine Vorn IP address", 502 "San name mismatch", 503 "San UUID
 // mismatch", or the directory's error. On failure neither the record nor the
-// local document is written (records created or removed on the way stay so).
+// local document is written (records created or removed on the way stay so),
+// and the "uuid" file (an earlier UUID of this controller) stays for the next
+// build. The record is published only when something changed; every
+// successful build stores its revision as the local "sanRevision".
 KOLT_EXPORT int buildSanConfig(const std::string* nodeName, const std::string* userName,
                                const std::string* password, ErrorSlot* error);
 

@@ -1,6 +1,8 @@
 // The local configuration document and the host identity.
 #include "kolt/local_config.h"
 
+#include "config/uuid_text.h"
+
 #include <strings.h>
 
 #include <cerrno>
@@ -67,12 +69,7 @@ void fillInOurUUIDFor(Env& env) {
       bytes.fill(0);
       log("fillInOurUUID returned error %d", rc);
     }
-    char text[37];
-    std::snprintf(text, sizeof text,
-                  "%02X%02X%02X%02X-%02X%02X-%02X%02X-%02X%02X-%02X%02X%02X%02X%02X%02X", bytes[0],
-                  bytes[1], bytes[2], bytes[3], bytes[4], bytes[5], bytes[6], bytes[7], bytes[8],
-                  bytes[9], bytes[10], bytes[11], bytes[12], bytes[13], bytes[14], bytes[15]);
-    env.hostUUIDCache() = text;
+    env.hostUUIDCache() = formatUUID(bytes);
   });
 }
 

@@ -20,6 +20,7 @@
 
 #include "kolt/env.h"
 #include "platform/directory/ldap_directory.h"
+#include "platform/path_components.h"
 #include "platform/posix_process.h"
 #include "plist/calendar.h"
 
@@ -96,19 +97,7 @@ bool parseHexUUID(std::string_view text, std::array<std::uint8_t, 16>* out) {
 // never climb above the root, so no path (a volume name "../../x" included)
 // names a file outside it. A relative path counts from the root.
 std::string mapBelowRoot(const std::string& root, std::string_view path) {
-  std::vector<std::string_view> parts;
-  std::size_t start = 0;
-  while (start <= path.size()) {
-    std::size_t end = path.find('/', start);
-    if (end == std::string_view::npos) end = path.size();
-    const std::string_view part = path.substr(start, end - start);
-    if (part == "..") {
-      if (!parts.empty()) parts.pop_back();
-    } else if (!part.empty() && part != ".") {
-      parts.push_back(part);
-    }
-    start = end + 1;
-  }
+  const std::vector<std::string_view> parts = pathComponents(path);
   std::string out = root == "/" ? std::string() : root;
   for (const std::string_view part : parts) {
     out += '/';

@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <utility>
 
 #include "config/uuid_text.h"
 #include "kolt/controller_helpers.h"
@@ -22,6 +23,9 @@ namespace kolt {
 namespace {
 
 // The settings a controller publishes from its local document, in order.
+// What redactVornSecrets shows in place of the shared secret.
+constexpr const char* kRedactedSecret = "********";
+
 constexpr const char* kPublishedKeys[] = {"sanConfigURLs", "desiredSearchPolicy", "notifications",
                                           "ownerEmail",    "ownerName",           "sanAuthMethod"};
 
@@ -56,6 +60,21 @@ bool startsWith(const std::string& s, std::string_view prefix) {
   return s.compare(0, prefix.size(), prefix) == 0;
 }
 
+// Logs `format` with the record as redactVornSecrets prints it, without
+// copying the record (it holds every volume's configuration): the secret is
+// masked in place for the line and put back.
+void logRedacted(const char* format, Value& record) {
+  std::optional<Value> topSecret, globalSecret;
+  Value* globals = record.find("globals");
+  if (Value* s = record.find("sharedSecret")) topSecret = std::exchange(*s, Value(kRedactedSecret));
+  if (Value* s = globals ? globals->find("sharedSecret") : nullptr) {
+    globalSecret = std::exchange(*s, Value(kRedactedSecret));
+  }
+  log(format, record);
+  if (topSecret) *record.find("sharedSecret") = std::move(*topSecret);
+  if (globalSecret) *globals->find("sharedSecret") = std::move(*globalSecret);
+}
+
 // Creates the SAN's records with the text of ".auth_secret" as the secret.
 std::optional<Error> createRecords(DirectoryNode& node, const Value& local) {
   const std::optional<std::string> secret = read_vorn_cfg_file(".auth_secret");
@@ -64,6 +83,29 @@ std::optional<Error> createRecords(DirectoryNode& node, const Value& local) {
     return orFallback(std::move(slot), "Unable to create the SAN configuration");
   }
   return std::nullopt;
+}
+
+// The "uuid" file names an earlier UUID of this controller: it becomes an
+// alias, and its controller entry and volume listings go. Returns whether the
+// file exists. A new alias publishes the record: the file is consumed by
+// this build, so an alias left unsaved would be lost.
+bool applyAliasFile(Value& record, const std::string& ourUUID, int* flags) {
+  const std::optional<std::string> aliasText = read_vorn_cfg_file("uuid");
+  if (!aliasText) return false;
+  const std::optional<UUIDBytes> alias = parseUUID(*aliasText);
+  if (!alias) return true;
+  const std::string aliasUUID = formatUUID(*alias);
+  if (aliasUUID == ourUUID) return true;
+  volumesOf(record);
+  Value& globals = globalsOf(record);
+  Value& volumes = volumesOf(record);
+  Value* aliases = globals.find("aliasControllers");
+  if (aliases == nullptr || !aliases->isArray())
+    aliases = &globals.set("aliasControllers", Value::array());
+  aliases->asArray()->push_back(Value(aliasUUID));
+  deleteControllerByUUID(globals, volumes, aliasUUID);
+  *flags |= kBuildPublish;
+  return true;
 }
 
 // The body of the build; returns the error that fails it, if any.
@@ -86,15 +128,19 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
 
   log("buildSanConfig about to check LDAP");
   const std::string node = nodeName ? *nodeName : std::string();
+  // Every directory step gets an empty slot of its own, so that a step that
+  // fails without an error object never reports an earlier step's error.
   ErrorSlot slot;
   std::unique_ptr<DirectoryNode> directory = env.openDirectoryNode("/LDAPv3/" + node, &slot);
   if (!directory) return orFallback(std::move(slot), "Unable to open the directory node");
   if (userName != nullptr && !userName->empty() && !startsWith(node, "ldapi:")) {
+    slot.reset();
     if (!directory->setCredentials(kRecordTypeUsers, *userName, password ? *password : "", &slot)) {
       return orFallback(std::move(slot), "Unable to authenticate to the directory");
     }
   }
 
+  slot.reset();
   std::optional<Value> record = getVornConfigForConfig(*directory, *local, &slot);
   if (!record) {
     log("buildSanConfig: getVornConfig said nothing");
@@ -103,8 +149,11 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
     }
     if (std::optional<Error> error = createRecords(*directory, *local)) return error;
   }
-  log("buildSanConfig step 4 with %@",
-      record ? std::optional<Value>(redactVornSecrets(*record)) : std::nullopt);
+  if (record) {
+    logRedacted("buildSanConfig step 4 with %@", *record);
+  } else {
+    log("buildSanConfig step 4 with %@", std::optional<Value>());
+  }
 
   const std::string* sanNameValue = local->findString("sanName");
   const std::string sanName = sanNameValue ? *sanNameValue : std::string();
@@ -131,6 +180,7 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
     const std::string* fetchedState = fetchedGlobals.findString("sanState");
     if (wasInitializing && fetchedState != nullptr && *fetchedState == "dead") {
       log("About to cul old SAN config");
+      slot.reset();
       if (culVornConfig(*directory, &sanName, &slot) != 0) {
         return orFallback(std::move(slot), "Unable to remove the old SAN configuration");
       }
@@ -163,7 +213,10 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
     globals.set("sanState", "active");
     flags = kBuildPublish;
   }
+  // Both made present first: adding one to the record would move the other.
+  volumesOf(*record);
   Value& globals = globalsOf(*record);
+  Value& volumes = volumesOf(*record);
 
   std::uint8_t copied = 0;
   for (const char* key : kPublishedKeys)
@@ -207,27 +260,18 @@ std::optional<Error> build(const std::string* nodeName, const std::string* userN
     flags |= kBuildPublish;
   }
 
-  buildVolumeConfig(volumesOf(*record), &flags);
+  buildVolumeConfig(volumes, &flags);
 
-  if (std::optional<std::string> aliasText = read_vorn_cfg_file("uuid")) {
-    if (std::optional<UUIDBytes> alias = parseUUID(*aliasText)) {
-      const std::string aliasUUID = formatUUID(*alias);
-      if (aliasUUID != ourUUID) {
-        Value& recordGlobals = globalsOf(*record);
-        Value* aliases = recordGlobals.find("aliasControllers");
-        if (aliases == nullptr || !aliases->isArray())
-          aliases = &recordGlobals.set("aliasControllers", Value::array());
-        aliases->asArray()->push_back(Value(aliasUUID));
-        deleteControllerByUUID(recordGlobals, volumesOf(*record), aliasUUID);
-      }
-    }
-    env.removeFile(std::string(kVornDirectory) + "uuid");
-  }
+  const bool hadAliasFile = applyAliasFile(*record, ourUUID, &flags);
 
-  log("buildSanConfig saving config %@", redactVornSecrets(*record));
+  logRedacted("buildSanConfig saving config %@", *record);
+  slot.reset();
   if (flags != 0 && saveVornConfig(*directory, *record, &sanName, true, &slot) != 0) {
     return orFallback(std::move(slot), "Unable to save the SAN configuration");
   }
+  // The "uuid" file is consumed only once the record that carries the alias
+  // is published; a failed save leaves it for the next build.
+  if (hadAliasFile) env.removeFile(std::string(kVornDirectory) + "uuid");
   if (std::optional<std::string> revision = buildRevisionStringFromConfig(*record)) {
     local->set("sanRevision", *revision);
   }

@@ -5,6 +5,8 @@
 #include <set>
 
 #include "config/tool_paths.h"
+#include "config/utf8_text.h"
+#include "config/uuid_text.h"
 #include "kolt/constants.h"
 #include "kolt/controller_helpers.h"
 #include "kolt/env.h"
@@ -30,47 +32,13 @@ std::string volumePath(const std::string& volume, const char* suffix) {
 }
 
 bool endsWith(const std::string& s, std::string_view suffix) {
-  return s.size() >= suffix.size() && s.compare(s.size() - suffix.size(), suffix.size(), suffix) == 0;
+  return s.size() >= suffix.size() &&
+         s.compare(s.size() - suffix.size(), suffix.size(), suffix) == 0;
 }
 
-bool validUTF8(std::string_view s) {
-  std::size_t i = 0;
-  while (i < s.size()) {
-    const unsigned char c = static_cast<unsigned char>(s[i]);
-    std::size_t extra = 0;
-    std::uint32_t cp = 0;
-    if (c < 0x80) {
-      ++i;
-      continue;
-    } else if ((c & 0xE0) == 0xC0) {
-      extra = 1;
-      cp = c & 0x1F;
-    } else if ((c & 0xF0) == 0xE0) {
-      extra = 2;
-      cp = c & 0x0F;
-    } else if ((c & 0xF8) == 0xF0) {
-      extra = 3;
-      cp = c & 0x07;
-    } else {
-      return false;
-    }
-    if (i + extra >= s.size()) return false;
-    for (std::size_t k = 1; k <= extra; ++k) {
-      const unsigned char cc = static_cast<unsigned char>(s[i + k]);
-      if ((cc & 0xC0) != 0x80) return false;
-      cp = (cp << 6) | (cc & 0x3F);
-    }
-    if ((extra == 1 && cp < 0x80) || (extra == 2 && cp < 0x800) || (extra == 3 && cp < 0x10000) ||
-        cp > 0x10FFFF || (cp >= 0xD800 && cp <= 0xDFFF)) {
-      return false;
-    }
-    i += extra + 1;
-  }
-  return true;
-}
-
-// Step 1: the volume files of hosted volumes, with their dates.
-FoundTable scanVolumeFiles(Env& env) {
+// Step 1: the volume files of hosted volumes, with their dates. Nothing when
+// the directory cannot be listed whole.
+std::optional<FoundTable> scanVolumeFiles(Env& env) {
   FoundTable table;
   std::set<std::string> hosted;
   for (const Value& name : getHostedVolumeList()) {
@@ -101,9 +69,32 @@ FoundTable scanVolumeFiles(Env& env) {
     }
   }
   if (rc != 0) {
-    log("Error got error '%@' for url '%@'", Error::fromErrno(rc), std::string(kVornDirectory));
+    log("Error got error '%@' for url '%@'", Error::fromErrno(rc),
+        "file://" + std::string(kVornDirectory));
+    return std::nullopt;
   }
   return table;
+}
+
+// Replaces `path` with `contents` dated `date`, in one step: the new file is
+// written and dated under a temporary name (which the scan passes over), then
+// renamed over `path`. On failure `path` is left as it was.
+std::optional<Error> replaceDated(Env& env, const std::string& path, const std::string& contents,
+                                  double date) {
+  const std::string temporary = path + ".kolt-new-" + newUUIDString(env);
+  int rc = writeFileAtomically(env, temporary, contents, 0644);
+  std::string failed = "Unable to write " + path;
+  if (rc == 0) {
+    rc = env.setModificationTime(temporary, date);
+    if (rc != 0) failed = "Unable to date " + path;
+  }
+  if (rc == 0) rc = env.renameFile(temporary, path);
+  if (rc != 0) {
+    env.removeFile(temporary);
+    return Error::fromErrno(rc, failed);
+  }
+  env.syncDirectory(parentDirectory(path));
+  return std::nullopt;
 }
 
 // Step 2 for one volume: converts its newer source into a ".cfgp". Returns
@@ -112,9 +103,10 @@ std::optional<Error> convertVolume(Env& env, const std::string& volume, FoundVol
   if (!found.cfg && !found.cfgx) return std::nullopt;
   const bool fromCfg = found.cfg && (!found.cfgx || *found.cfg >= *found.cfgx);
   const double sourceDate = fromCfg ? *found.cfg : *found.cfgx;
-  // The ".cfgp" carries its source's date; compare at the precision a
-  // published date keeps.
-  if (found.cfgp && std::floor(*found.cfgp) >= std::floor(sourceDate)) return std::nullopt;
+  // A ".cfgp" made from this source carries the source's very date. The
+  // comparison is exact: an edit made within the same second as the last
+  // conversion is still converted.
+  if (found.cfgp && *found.cfgp >= sourceDate) return std::nullopt;
 
   ProcessSpec spec;
   spec.executable = std::string(kToolDirectory) + "pdcfgconvert";
@@ -128,23 +120,20 @@ std::optional<Error> convertVolume(Env& env, const std::string& volume, FoundVol
     return Error::fromErrno(rc, failure);
   }
   if (result.exitStatus != 0) return Error::posix(result.exitStatus, failure);
-  if (!validUTF8(result.output)) return std::nullopt;  // passed over silently
+  if (!utf8::isValid(result.output)) return std::nullopt;  // passed over silently
 
   // Parse before writing, so that unreadable output never replaces a good
   // ".cfgp".
   ErrorSlot parseError;
   std::optional<Value> parsed = parsePropertyList(result.output, &parseError);
   if (!parsed) {
-    return Error::vorn(kVornVolumeConfigUnreadable,
-                       parseError && parseError->description() ? *parseError->description()
-                                                               : "unreadable converter output");
+    return Error::vorn(kVornVolumeConfigUnreadable, parseError && parseError->description()
+                                                        ? *parseError->description()
+                                                        : "unreadable converter output");
   }
-  const std::string cfgpPath = volumePath(volume, cfgpSuffix);
-  if (const int rc = writeFileAtomically(env, cfgpPath, result.output, 0644); rc != 0) {
-    return Error::fromErrno(rc, "Unable to write " + cfgpPath);
-  }
-  if (const int rc = env.setModificationTime(cfgpPath, sourceDate); rc != 0) {
-    return Error::fromErrno(rc, "Unable to date " + cfgpPath);
+  if (std::optional<Error> error =
+          replaceDated(env, volumePath(volume, cfgpSuffix), result.output, sourceDate)) {
+    return error;
   }
   found.volData = std::move(parsed);
   found.cfgp = sourceDate;
@@ -157,7 +146,8 @@ std::optional<Error> convertVolume(Env& env, const std::string& volume, FoundVol
   return std::nullopt;
 }
 
-// Step 3: the ".cfgp" content of volumes that were not converted.
+// Step 3, done in the merge for the volumes whose entry needs it: the
+// ".cfgp" content of a volume that was not converted.
 void loadVolume(Env& env, const std::string& volume, FoundVolume& found) {
   if (found.volData) return;
   std::string bytes;
@@ -190,41 +180,56 @@ Value newVolumeEntry(const FoundVolume& found, const std::string& ourUUID) {
 
 }  // namespace
 
-bool sameWholeSecond(double a, double b) { return std::floor(a) == std::floor(b); }
+bool sameWholeSecond(double a, double b) {
+  return std::floor(a) == std::floor(b);
+}
 
 void buildVolumeConfig(Value& volumes, int* changeFlags) {
   Env& env = currentEnv();
   if (!volumes.isDictionary()) volumes = Value::dictionary();
-  FoundTable table = scanVolumeFiles(env);
+  // A listing cut short would make every volume it missed look released by
+  // this controller; the record keeps its volumes instead.
+  std::optional<FoundTable> scanned = scanVolumeFiles(env);
+  if (!scanned) return;
+  FoundTable& table = *scanned;
 
   for (auto& [volume, found] : table) {
-    if (std::optional<Error> error = convertVolume(env, volume, found)) return;
+    if (std::optional<Error> error = convertVolume(env, volume, found)) {
+      // The record keeps its volumes as they were; the line tells the
+      // administrator why an edit was not published.
+      log("buildVolumeConfig: %@", *error);
+      return;
+    }
   }
-  for (auto& [volume, found] : table) loadVolume(env, volume, found);
-
   std::set<std::string> unseen;
   for (const auto& [name, entry] : *volumes.asDictionary()) unseen.insert(name);
   const std::string& ourUUID = getOurUUID();
   bool changed = false;
 
-  for (const auto& [volume, found] : table) {
+  for (auto& [volume, found] : table) {
     const bool wasListed = unseen.erase(volume) > 0;
+    Value* entry = wasListed ? volumes.find(volume) : nullptr;
+    if (entry != nullptr && !entry->isDictionary()) entry = nullptr;
+    bool current = false, hosted = false;
+    if (entry != nullptr && found.cfgp) {
+      const Value* mtime = entry->find(mtimeKey);
+      current = mtime && mtime->asDate() && sameWholeSecond(mtime->asDate()->seconds, *found.cfgp);
+      const Array* controllers = entry->findArray(controllersKey);
+      hosted = controllers && containsString(*controllers, ourUUID);
+      // A current entry that names this controller needs nothing from the
+      // file, which is then not even read: the common case of a build.
+      if (current && hosted) continue;
+    }
+    loadVolume(env, volume, found);
     if (!found.volData || !found.cfgp) continue;  // nothing readable: the entry stays as it was
-    Value* entry = volumes.find(volume);
-    if (!wasListed || entry == nullptr || !entry->isDictionary()) {
+    changed = true;
+    if (entry == nullptr) {
       volumes.set(volume, newVolumeEntry(found, ourUUID));
-      changed = true;
       continue;
     }
-    const Value* mtime = entry->find(mtimeKey);
-    const bool current = mtime && mtime->asDate() && sameWholeSecond(mtime->asDate()->seconds, *found.cfgp);
-    Array& controllers = controllersOf(*entry);
-    const bool hosted = containsString(controllers, ourUUID);
-    if (current && hosted) continue;
-    changed = true;
-    if (!hosted) controllers.push_back(Value(ourUUID));
+    if (!hosted) controllersOf(*entry).push_back(Value(ourUUID));
     if (!current) {
-      entry->set(configKey, *found.volData);
+      entry->set(configKey, std::move(*found.volData));
       entry->set(mtimeKey, Value::date(*found.cfgp));
     }
   }

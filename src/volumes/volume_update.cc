@@ -2,12 +2,15 @@
 // from a "volumes" dictionary.
 #include "volumes/volume_update.h"
 
+#include "config/tool_paths.h"
+
 #include <algorithm>
 #include <cmath>
 #include <map>
 #include <set>
 
 #include "config/hosted_volume_list.h"
+#include "config/tool_paths.h"
 #include "kolt/constants.h"
 #include "kolt/controller_helpers.h"
 #include "kolt/env.h"
@@ -104,7 +107,7 @@ Value printableSet(const std::set<std::string>& names) {
 
 void startVolume(Env& env, const std::string& volume) {
   ProcessSpec spec;
-  spec.executable = kQmadminPath;
+  spec.executable = std::string(kToolDirectory) + kQmadminName;
   spec.arguments = {"-e", "start " + volume};
   spec.standardInput = StreamSpec::null();
   spec.standardOutput = StreamSpec::appendTo("/var/run/vorn_qmadmin_" + volume + ".log");

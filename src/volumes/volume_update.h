@@ -8,8 +8,8 @@
 
 namespace kolt {
 
-inline constexpr const char* kQmadminPath =
-    "/System/Library/Filesystems/kolt.fs/Contents/bin/qmadmin";
+// The administration tool, in the tools' directory (kToolDirectory).
+inline constexpr const char* kQmadminName = "qmadmin";
 
 // For every volume (name to {"config", "mtime", "controllers"}) of `volumes`:
 // - hosted here (its "controllers" holds getOurUUID()) with a date "mtime":

@@ -2,6 +2,7 @@
 #ifndef KOLT_PLATFORM_DIRECTORY_DIRECTORY_ERROR_H
 #define KOLT_PLATFORM_DIRECTORY_DIRECTORY_ERROR_H
 
+#include <optional>
 #include <string_view>
 
 #include "kolt/error.h"
@@ -13,6 +14,17 @@ namespace kolt {
 // followed by ": " and `diagnostic` when there is one (the server's
 // diagnostic message or our own detail). Never pass a password here.
 Error directoryError(int resultCode, std::string_view diagnostic = {});
+
+// Stores `e` in the slot (when given) and returns the failed result of an
+// operation that answers nothing / false.
+inline std::nullopt_t failWithNothing(ErrorSlot* slot, Error e) {
+  setError(slot, std::move(e));
+  return std::nullopt;
+}
+inline bool failWithFalse(ErrorSlot* slot, Error e) {
+  setError(slot, std::move(e));
+  return false;
+}
 
 }  // namespace kolt
 

@@ -160,7 +160,7 @@ class LdapRecord final : public DirectoryRecord {
                                                                   ErrorSlot* error) override {
     if (auto it = views_.find(attribute); it != views_.end()) return it->second;
     std::lock_guard lock(connection_->mutex());
-    if (auto e = connection_->ready()) return fail(error, std::move(*e));
+    if (auto e = connection_->ready()) return failWithNothing(error, std::move(*e));
     LDAP* ld = connection_->handle();
     const char* attrs[] = {ldapAttribute(type_, attribute), nullptr};
     LDAPMessage* result = nullptr;
@@ -169,12 +169,12 @@ class LdapRecord final : public DirectoryRecord {
         ldap_search_ext_s(ld, dn_.c_str(), LDAP_SCOPE_BASE, "(objectClass=*)",
                           const_cast<char**>(attrs), 0, nullptr, nullptr, &timeout, 1, &result);
     Message message(result, ldap_msgfree);
-    if (rc != LDAP_SUCCESS) return fail(error, connection_->error(rc));
+    if (rc != LDAP_SUCCESS) return failWithNothing(error, connection_->error(rc));
     LDAPMessage* entry = ldap_first_entry(ld, result);
     ValueViews views;
-    if (entry == nullptr) return fail(error, directoryError(LDAP_NO_SUCH_OBJECT));
+    if (entry == nullptr) return failWithNothing(error, directoryError(LDAP_NO_SUCH_OBJECT));
     if (!readEntry(ld, entry, type_, &views))
-      return fail(error, connection_->error(LDAP_DECODING_ERROR));
+      return failWithNothing(error, connection_->error(LDAP_DECODING_ERROR));
     adopt(std::move(message), std::move(views));
     fetched(attribute);
     return views_[attribute];
@@ -183,15 +183,15 @@ class LdapRecord final : public DirectoryRecord {
   bool setValues(Attribute attribute, const std::vector<std::string>& values,
                  ErrorSlot* error) override {
     if (attribute == Attribute::kRecordName) {
-      return failed(error, directoryError(LDAP_NOT_SUPPORTED, "the record name cannot be changed"));
+      return failWithFalse(error, directoryError(LDAP_NOT_SUPPORTED, "the record name cannot be changed"));
     }
     std::lock_guard lock(connection_->mutex());
-    if (auto e = connection_->ready()) return failed(error, std::move(*e));
+    if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
     Modifications mods;
     mods.add(LDAP_MOD_REPLACE, ldapAttribute(type_, attribute), values);
     const int rc =
         ldap_modify_ext_s(connection_->handle(), dn_.c_str(), mods.get(), nullptr, nullptr);
-    if (rc != LDAP_SUCCESS) return failed(error, connection_->error(rc));
+    if (rc != LDAP_SUCCESS) return failWithFalse(error, connection_->error(rc));
     own(attribute, values);
     return true;
   }
@@ -201,14 +201,14 @@ class LdapRecord final : public DirectoryRecord {
   bool changePassword(const std::optional<std::string>& oldPassword, const std::string& newPassword,
                       ErrorSlot* error) override {
     if (type_ != RecordType::kUsers) {
-      return failed(error, directoryError(LDAP_NOT_SUPPORTED, "only users have passwords"));
+      return failWithFalse(error, directoryError(LDAP_NOT_SUPPORTED, "only users have passwords"));
     }
     // An empty new password would make the server generate one.
     if (newPassword.empty()) {
-      return failed(error, directoryError(LDAP_PARAM_ERROR, "an empty password is refused"));
+      return failWithFalse(error, directoryError(LDAP_PARAM_ERROR, "an empty password is refused"));
     }
     std::lock_guard lock(connection_->mutex());
-    if (auto e = connection_->ready()) return failed(error, std::move(*e));
+    if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
     berval user{static_cast<ber_len_t>(dn_.size()), dn_.data()};
     berval next{static_cast<ber_len_t>(newPassword.size()), const_cast<char*>(newPassword.data())};
     berval old{0, nullptr};
@@ -218,46 +218,37 @@ class LdapRecord final : public DirectoryRecord {
     const int rc = ldap_passwd_s(connection_->handle(), &user, oldPassword ? &old : nullptr, &next,
                                  &generated, nullptr, nullptr);
     ber_memfree(generated.bv_val);
-    if (rc != LDAP_SUCCESS) return failed(error, connection_->error(rc));
+    if (rc != LDAP_SUCCESS) return failWithFalse(error, connection_->error(rc));
     return true;
   }
 
   bool addMemberRecord(const DirectoryRecord& member, ErrorSlot* error) override {
     const auto* user = dynamic_cast<const LdapRecord*>(&member);
     if (type_ != RecordType::kGroups || user == nullptr || user->type_ != RecordType::kUsers) {
-      return failed(error, directoryError(LDAP_PARAM_ERROR, "a group takes user records"));
+      return failWithFalse(error, directoryError(LDAP_PARAM_ERROR, "a group takes user records"));
     }
     std::lock_guard lock(connection_->mutex());
-    if (auto e = connection_->ready()) return failed(error, std::move(*e));
+    if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
     Modifications mods;
     mods.add(LDAP_MOD_ADD, "member", {user->dn_});
     const int rc =
         ldap_modify_ext_s(connection_->handle(), dn_.c_str(), mods.get(), nullptr, nullptr);
     // Already a member: nothing to do.
     if (rc != LDAP_SUCCESS && rc != LDAP_TYPE_OR_VALUE_EXISTS) {
-      return failed(error, connection_->error(rc));
+      return failWithFalse(error, connection_->error(rc));
     }
     return true;
   }
 
   bool deleteRecord(ErrorSlot* error) override {
     std::lock_guard lock(connection_->mutex());
-    if (auto e = connection_->ready()) return failed(error, std::move(*e));
+    if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
     const int rc = ldap_delete_ext_s(connection_->handle(), dn_.c_str(), nullptr, nullptr);
-    if (rc != LDAP_SUCCESS) return failed(error, connection_->error(rc));
+    if (rc != LDAP_SUCCESS) return failWithFalse(error, connection_->error(rc));
     return true;
   }
 
  private:
-  static std::nullopt_t fail(ErrorSlot* slot, Error e) {
-    setError(slot, std::move(e));
-    return std::nullopt;
-  }
-  static bool failed(ErrorSlot* slot, Error e) {
-    setError(slot, std::move(e));
-    return false;
-  }
-
   std::shared_ptr<LdapConnection> connection_;
   RecordType type_;
   std::string dn_;  // as the server returned it, or as we built it

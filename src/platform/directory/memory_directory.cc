@@ -103,12 +103,12 @@ class MemoryRecord final : public DirectoryRecord {
                                                                   ErrorSlot* error) override {
     std::lock_guard lock(dir_->mutex());
     if (auto e = dir_->enterLocked(DirectoryOperation::kReadValues, session_.get())) {
-      return fail(error, std::move(*e));
+      return failWithNothing(error, std::move(*e));
     }
     auto cached = cache_.find(attribute);
     if (cached == cache_.end()) {
       const void* entry = readableEntryLocked();
-      if (entry == nullptr) return fail(error, directoryError(LDAP_NO_SUCH_OBJECT));
+      if (entry == nullptr) return failWithNothing(error, directoryError(LDAP_NO_SUCH_OBJECT));
       cached = cache_.emplace(attribute, *entryValues(type_, entry, attribute)).first;
     }
     return std::vector<std::string_view>(cached->second.begin(), cached->second.end());
@@ -118,10 +118,10 @@ class MemoryRecord final : public DirectoryRecord {
                  ErrorSlot* error) override {
     std::lock_guard lock(dir_->mutex());
     if (auto e = dir_->enterLocked(DirectoryOperation::kSetValues, session_.get())) {
-      return failed(error, std::move(*e));
+      return failWithFalse(error, std::move(*e));
     }
-    if (auto e = checkValues(type_, attribute, values)) return failed(error, std::move(*e));
-    if (auto e = writableLocked()) return failed(error, std::move(*e));
+    if (auto e = checkValues(type_, attribute, values)) return failWithFalse(error, std::move(*e));
+    if (auto e = writableLocked()) return failWithFalse(error, std::move(*e));
     const std::string key = MemoryDirectory::matchKey(name_);
     if (type_ == RecordType::kUsers) {
       dir_->usersLocked().at(key).fullNames = values;
@@ -138,7 +138,7 @@ class MemoryRecord final : public DirectoryRecord {
   bool synchronize(ErrorSlot* error) override {
     std::lock_guard lock(dir_->mutex());
     if (auto e = dir_->enterLocked(DirectoryOperation::kSynchronize, session_.get())) {
-      return failed(error, std::move(*e));
+      return failWithFalse(error, std::move(*e));
     }
     return true;  // every change is stored at once
   }
@@ -147,18 +147,18 @@ class MemoryRecord final : public DirectoryRecord {
                       ErrorSlot* error) override {
     std::lock_guard lock(dir_->mutex());
     if (auto e = dir_->enterLocked(DirectoryOperation::kChangePassword, session_.get())) {
-      return failed(error, std::move(*e));
+      return failWithFalse(error, std::move(*e));
     }
     if (type_ != RecordType::kUsers) {
-      return failed(error, directoryError(LDAP_NOT_SUPPORTED, "only users have passwords"));
+      return failWithFalse(error, directoryError(LDAP_NOT_SUPPORTED, "only users have passwords"));
     }
     if (newPassword.empty()) {
-      return failed(error, directoryError(LDAP_PARAM_ERROR, "an empty password is refused"));
+      return failWithFalse(error, directoryError(LDAP_PARAM_ERROR, "an empty password is refused"));
     }
-    if (auto e = writableLocked()) return failed(error, std::move(*e));
+    if (auto e = writableLocked()) return failWithFalse(error, std::move(*e));
     auto& user = dir_->usersLocked().at(MemoryDirectory::matchKey(name_));
     if (oldPassword && *oldPassword != user.password) {
-      return failed(error, directoryError(LDAP_UNWILLING_TO_PERFORM, "old password mismatch"));
+      return failWithFalse(error, directoryError(LDAP_UNWILLING_TO_PERFORM, "old password mismatch"));
     }
     user.password = newPassword;
     return true;
@@ -167,14 +167,14 @@ class MemoryRecord final : public DirectoryRecord {
   bool addMemberRecord(const DirectoryRecord& member, ErrorSlot* error) override {
     std::lock_guard lock(dir_->mutex());
     if (auto e = dir_->enterLocked(DirectoryOperation::kAddMember, session_.get())) {
-      return failed(error, std::move(*e));
+      return failWithFalse(error, std::move(*e));
     }
     const auto* user = dynamic_cast<const MemoryRecord*>(&member);
     if (type_ != RecordType::kGroups || user == nullptr || user->type_ != RecordType::kUsers ||
         user->dir_ != dir_) {
-      return failed(error, directoryError(LDAP_PARAM_ERROR, "a group takes user records"));
+      return failWithFalse(error, directoryError(LDAP_PARAM_ERROR, "a group takes user records"));
     }
-    if (auto e = writableLocked()) return failed(error, std::move(*e));
+    if (auto e = writableLocked()) return failWithFalse(error, std::move(*e));
     auto& members = dir_->groupsLocked().at(MemoryDirectory::matchKey(name_)).members;
     const std::string key = MemoryDirectory::matchKey(user->name_);
     const bool present = std::any_of(members.begin(), members.end(), [&](const std::string& m) {
@@ -187,9 +187,9 @@ class MemoryRecord final : public DirectoryRecord {
   bool deleteRecord(ErrorSlot* error) override {
     std::lock_guard lock(dir_->mutex());
     if (auto e = dir_->enterLocked(DirectoryOperation::kDeleteRecord, session_.get())) {
-      return failed(error, std::move(*e));
+      return failWithFalse(error, std::move(*e));
     }
-    if (auto e = writableLocked()) return failed(error, std::move(*e));
+    if (auto e = writableLocked()) return failWithFalse(error, std::move(*e));
     const std::string key = MemoryDirectory::matchKey(name_);
     if (type_ == RecordType::kUsers) {
       dir_->usersLocked().erase(key);
@@ -200,14 +200,6 @@ class MemoryRecord final : public DirectoryRecord {
   }
 
  private:
-  static std::nullopt_t fail(ErrorSlot* slot, Error e) {
-    setError(slot, std::move(e));
-    return std::nullopt;
-  }
-  static bool failed(ErrorSlot* slot, Error e) {
-    setError(slot, std::move(e));
-    return false;
-  }
 
   // The stored entry when the session may read it, else null.
   const void* readableEntryLocked() {

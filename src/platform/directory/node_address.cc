@@ -38,20 +38,6 @@ std::optional<std::string> percentDecode(std::string_view s) {
   return out;
 }
 
-std::string percentEncodePath(std::string_view s) {
-  static const char* kHex = "0123456789ABCDEF";
-  std::string out;
-  for (unsigned char c : s) {
-    if (std::isalnum(c) || c == '-' || c == '.' || c == '_' || c == '~') {
-      out += static_cast<char>(c);
-    } else {
-      out += '%';
-      out += kHex[c >> 4];
-      out += kHex[c & 15];
-    }
-  }
-  return out;
-}
 
 // Splits "host[:port]" (IPv6 in brackets) into its parts; false when the
 // text is not such a pair.
@@ -171,6 +157,21 @@ std::string serverKey(const NodeAddress& address) {
     return "ldapi://" + percentEncodePath(address.socketPath);
   return connectionUrl(NodeAddress{address.scheme, toLower(address.host), address.port, {}, {}},
                        {});
+}
+
+std::string percentEncodePath(std::string_view s) {
+  static const char* kHex = "0123456789ABCDEF";
+  std::string out;
+  for (unsigned char c : s) {
+    if (std::isalnum(c) || c == '-' || c == '.' || c == '_' || c == '~') {
+      out += static_cast<char>(c);
+    } else {
+      out += '%';
+      out += kHex[c >> 4];
+      out += kHex[c & 15];
+    }
+  }
+  return out;
 }
 
 }  // namespace kolt

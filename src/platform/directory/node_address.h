@@ -32,6 +32,10 @@ struct NodeAddress {
   std::string url;         // the URL as given, or "ldap://" + host[:port]
 };
 
+// Percent-encodes a socket path for an ldapi:// URL: every byte but ASCII
+// letters, digits and - . _ ~ becomes "%XX".
+std::string percentEncodePath(std::string_view path);
+
 // Parses a node name. Nothing when it is not "/LDAPv3/" followed by an
 // ldap://, ldaps:// or ldapi:// URL (no DN, attributes or extensions) or by
 // host[:port].
