@@ -33,10 +33,12 @@ KOLT_EXPORT int checkSanConfigChange(std::uint32_t* changeMask, Value* newConfig
 // Returns 0 on success or when there is nothing to do; 14 without a mask;
 // 504 "San name missing" (also for a local document that names directory
 // URLs but no SAN); 505 "San server missing"; 502 "San name mismatch"; 22
-// when config.plist could not be saved; 500 when the SAN is dead and a
+// when config.plist could not be saved ("Error saving config.plist") or the
+// stored configuration cannot be read; 500 when the SAN is dead and a
 // newConfig was given; otherwise the directory's code (501 when there is no
 // configuration record). Nothing local is written before the configuration
-// was fetched. The shared secret is never saved in config.plist; it lives in
+// was fetched. A published "volumes" that is not a dictionary touches no
+// volume file. The shared secret is never saved in config.plist; it lives in
 // ".auth_secret" (mode 0600).
 //
 // When the published revision equals the applied one ("sanRevision"), only
