@@ -14,6 +14,7 @@
 
 #include <array>
 #include <cstdint>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -91,6 +92,48 @@ struct InterfaceAddress {
   std::string address;        // binary address: 4 bytes (IPv4) or 16 (IPv6); empty when none
 };
 
+// What a directory node learned about a server's search base when it opened
+// (the server's root DSE), kept so that later nodes of the same server skip
+// that exchange. Keys are a server's identity: "ldap://host:port" or
+// "ldaps://host:port" (host in lower case), or "ldapi://" and the
+// percent-encoded host path of the socket. The directory client fills it
+// after reading a root DSE, reads it when it opens a node, and drops an entry
+// when an operation fails in a way a wrong base explains (docs/directory.md).
+// Thread-safe. Holds at most kMaxServers entries; storing one more forgets
+// another.
+class SearchBaseCache {
+ public:
+  static constexpr std::size_t kMaxServers = 64;
+
+  struct Entry {
+    std::vector<std::string> namingContexts;  // as the root DSE listed them
+    std::string base;                          // the one chosen among them
+  };
+
+  // The entry for `server`, if any.
+  std::optional<Entry> find(const std::string& server) const {
+    std::lock_guard lock(mutex_);
+    auto it = entries_.find(server);
+    if (it == entries_.end()) return std::nullopt;
+    return it->second;
+  }
+  void store(const std::string& server, Entry entry) {
+    std::lock_guard lock(mutex_);
+    if (entries_.size() >= kMaxServers && entries_.count(server) == 0) {
+      entries_.erase(entries_.begin());
+    }
+    entries_[server] = std::move(entry);
+  }
+  void forget(const std::string& server) {
+    std::lock_guard lock(mutex_);
+    entries_.erase(server);
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::map<std::string, Entry> entries_;
+};
+
 class KOLT_EXPORT Env {
  public:
   Env();
@@ -162,9 +205,16 @@ class KOLT_EXPORT Env {
   std::once_flag& hostUUIDOnce() { return hostUUIDOnce_; }
   std::string& hostUUIDCache() { return hostUUIDCache_; }
 
+  // --- The search-base cache -------------------------------------------------------
+  // Belongs to the Env like the host-UUID cache: process-wide with the
+  // default Env, one per simulated machine otherwise. An EnvWrapper has its
+  // own, unused: its nodes are opened by (and cached in) its target.
+  SearchBaseCache& searchBaseCache() { return searchBaseCache_; }
+
  private:
   std::once_flag hostUUIDOnce_;
   std::string hostUUIDCache_;
+  SearchBaseCache searchBaseCache_;
 };
 
 // The Env that the library's operations use. Initially a PosixEnv rooted at

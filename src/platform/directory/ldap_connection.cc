@@ -4,6 +4,7 @@
 #include <string.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <memory>
 
 #include "platform/directory/directory_error.h"
@@ -28,7 +29,13 @@ timeval operationTimeout() {
 }  // namespace
 
 LdapConnection::LdapConnection(Env& env, NodeAddress address)
-    : env_(env), address_(std::move(address)) {}
+    : env_(env), address_(std::move(address)) {
+  // An ldapi server is known by the socket it is reached through: the same
+  // system path leads to another server below another root.
+  serverKey_ = address_.scheme == LdapScheme::kLdapi
+                   ? "ldapi://" + percentEncodePath(env_.hostPath(address_.socketPath))
+                   : serverKey(address_);
+}
 
 LdapConnection::~LdapConnection() {
   drop();
@@ -130,7 +137,7 @@ std::optional<Error> LdapConnection::startTlsIfRequired() {
   return std::nullopt;
 }
 
-std::optional<Error> LdapConnection::readNamingContexts() {
+std::optional<Error> LdapConnection::readNamingContexts(std::vector<std::string>* contexts) {
   LDAPMessage* result = nullptr;
   timeval timeout = operationTimeout();
   const int rc = ldap_search_ext_s(ld_, "", LDAP_SCOPE_BASE, "(objectClass=*)",
@@ -138,20 +145,61 @@ std::optional<Error> LdapConnection::readNamingContexts() {
                                    &timeout, 0, &result);
   std::unique_ptr<LDAPMessage, decltype(&ldap_msgfree)> holder(result, ldap_msgfree);
   if (rc != LDAP_SUCCESS) return error(rc);
-  namingContexts_.clear();
+  contexts->clear();
   LDAPMessage* entry = ldap_first_entry(ld_, result);
   if (entry != nullptr) {
     berval** values = ldap_get_values_len(ld_, entry, "namingContexts");
     for (int i = 0; values != nullptr && values[i] != nullptr; ++i) {
-      namingContexts_.emplace_back(values[i]->bv_val, values[i]->bv_len);
+      contexts->emplace_back(values[i]->bv_val, values[i]->bv_len);
     }
     ldap_value_free_len(values);
   }
-  if (namingContexts_.empty()) {
+  if (contexts->empty()) {
     return directoryError(LDAP_NO_SUCH_OBJECT, "the server names no naming context");
   }
-  if (base_.empty()) base_ = namingContexts_[0];
   return std::nullopt;
+}
+
+// What the Env's cache knows of this server, taken as if read from its root
+// DSE; confirmed by the first operation that finds the base.
+bool LdapConnection::takeCachedBase() {
+  std::optional<SearchBaseCache::Entry> entry = env_.searchBaseCache().find(serverKey_);
+  if (!entry || entry->namingContexts.empty() || entry->base.empty()) return false;
+  namingContexts_ = std::move(entry->namingContexts);
+  base_ = std::move(entry->base);
+  baseConfirmed_ = true;
+  baseFromCache_ = true;
+  return true;
+}
+
+// The session acts as every node of the server does at opening (anonymous,
+// or the local superuser on ldapi), so the base it chose is every node's.
+bool LdapConnection::openingIdentity() const {
+  return !userName_ && (address_.scheme != LdapScheme::kLdapi || external_);
+}
+
+void LdapConnection::rememberBase() {
+  if (baseFromCache_ || !baseConfirmed_ || !openingIdentity()) return;
+  env_.searchBaseCache().store(serverKey_, {namingContexts_, base_});
+}
+
+bool LdapConnection::refreshStaleBase() {
+  if (!baseFromCache_) return false;
+  // Once per connection: whatever the root DSE says now is final.
+  baseFromCache_ = false;
+  if (ld_ == nullptr && connect()) return false;
+  std::vector<std::string> contexts;
+  if (readNamingContexts(&contexts)) return false;
+  // The contexts the cache knew: the base is right and the failure the
+  // operation's own (a wrong password, a record that is not there).
+  if (contexts == namingContexts_) return false;
+  env_.searchBaseCache().forget(serverKey_);
+  namingContexts_ = std::move(contexts);
+  base_ = namingContexts_[0];
+  baseConfirmed_ = false;
+  chooseBaseByProbing();
+  rememberBase();
+  return true;
 }
 
 // The first naming context whose groups container the session can see.
@@ -196,7 +244,24 @@ std::optional<Error> LdapConnection::ready() {
   if (ld_ != nullptr && closedByServer()) drop();
   if (ld_ != nullptr) return std::nullopt;
   if (auto e = connect()) return e;
-  if (auto e = readNamingContexts()) return e;
+  // The first connection takes the base from the Env's cache when it knows
+  // the server. A later one (after a lost connection: the server may have
+  // restarted with other contexts) reads the root DSE again.
+  const bool first = namingContexts_.empty();
+  if (!first || !takeCachedBase()) {
+    std::vector<std::string> contexts;
+    if (auto e = readNamingContexts(&contexts)) return e;
+    if (!first && contexts != namingContexts_ &&
+        std::find(contexts.begin(), contexts.end(), base_) == contexts.end()) {
+      // The base is gone: choose again.
+      env_.searchBaseCache().forget(serverKey_);
+      base_.clear();
+      baseConfirmed_ = false;
+    }
+    baseFromCache_ = false;
+    namingContexts_ = std::move(contexts);
+    if (base_.empty()) base_ = namingContexts_[0];
+  }
   if (userName_) {
     if (auto e = startTlsIfRequired()) return e;
     const int rc = simpleBind(recordDn(RecordType::kUsers, *userName_), password_);
@@ -208,6 +273,7 @@ std::optional<Error> LdapConnection::ready() {
     if (rc != LDAP_SUCCESS) return error(rc);
   }
   chooseBaseByProbing();
+  if (first) rememberBase();
   return std::nullopt;
 }
 
@@ -256,7 +322,15 @@ std::optional<Error> LdapConnection::setCredentials(const std::string& name,
     becomeAnonymous();
     return directoryError(LDAP_INVALID_CREDENTIALS, "empty password");
   }
-  if (auto e = bindAsUser(name, password)) return e;
+  std::optional<Error> e = bindAsUser(name, password);
+  // A user not found under a cached base may live under the server's
+  // current one (the server was set up anew with another suffix).
+  if (e && e->code() == LDAP_INVALID_CREDENTIALS && refreshStaleBase()) {
+    e = bindAsUser(name, password);
+  }
+  if (e) return e;
+  // The server accepted a DN under the base: it is the server's own.
+  baseFromCache_ = false;
   baseConfirmed_ = true;
   userName_ = name;
   password_ = password;

@@ -36,17 +36,28 @@ class LdapConnection {
   // Connects when not connected (at the node's opening, and again after a
   // lost connection), binds as the session's credentials (none, SASL
   // EXTERNAL on ldapi, or the user set by setCredentials) and finds the
-  // search base. The connection is kept for every later operation; one that
-  // the server closed since its last use (a restart) is noticed before the
-  // next operation, which then connects again.
+  // search base: at the first connection from the Env's search-base cache
+  // when it knows the server, else from the root DSE (then cached). The
+  // connection is kept for every later operation; one that the server
+  // closed since its last use (a restart) is noticed before the next
+  // operation, which then connects again.
   std::optional<Error> ready();
   LDAP* handle() { return ld_; }
   const std::string& base() const { return base_; }
 
   // Simple bind as the user record `name` on the kept connection (after
   // StartTLS where the transport rule asks for it); see DirectoryNode. A
-  // failure leaves the session anonymous.
+  // failure leaves the session anonymous. Invalid credentials under a
+  // cached base are tried once more when the root DSE names other contexts.
   std::optional<Error> setCredentials(const std::string& name, const std::string& password);
+
+  // For an operation under the base that failed in a way a wrong base
+  // explains (noSuchObject). When the base came from the Env's cache and was
+  // not confirmed on this connection yet, reads the root DSE once and
+  // chooses the base anew, dropping the cache entry when the server's
+  // contexts changed. True when the base changed, so the operation is worth
+  // one more try (and only one: a second call returns false).
+  bool refreshStaleBase();
 
   // The error for result code `rc` of the last operation, with the
   // server's diagnostic message. A lost connection is dropped, so the next
@@ -64,7 +75,11 @@ class LdapConnection {
   std::optional<Error> bindAsUser(const std::string& name, const std::string& password);
   void becomeAnonymous();
   bool closedByServer() const;
-  std::optional<Error> readNamingContexts();
+  std::optional<Error> readNamingContexts(std::vector<std::string>* contexts);
+  bool takeCachedBase();
+  bool refreshBase(bool probe);
+  bool openingIdentity() const;
+  void rememberBase();
   int simpleBind(const std::string& dn, const std::string& password);
   void chooseBaseByProbing();
   void drop();
@@ -74,9 +89,13 @@ class LdapConnection {
   NodeAddress address_;
   LDAP* ld_ = nullptr;
   bool tls_ = false;
+  std::string serverKey_;  // the key of the Env's search-base cache
   std::vector<std::string> namingContexts_;
   std::string base_;
   bool baseConfirmed_ = false;
+  // The contexts and base came from the Env's cache and no root DSE of this
+  // connection has confirmed them yet.
+  bool baseFromCache_ = false;
   // The user the session is bound as, kept to bind again after a lost
   // connection. Never logged, never put into an error.
   std::optional<std::string> userName_;

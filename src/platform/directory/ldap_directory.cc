@@ -183,7 +183,8 @@ class LdapRecord final : public DirectoryRecord {
   bool setValues(Attribute attribute, const std::vector<std::string>& values,
                  ErrorSlot* error) override {
     if (attribute == Attribute::kRecordName) {
-      return failWithFalse(error, directoryError(LDAP_NOT_SUPPORTED, "the record name cannot be changed"));
+      return failWithFalse(error,
+                           directoryError(LDAP_NOT_SUPPORTED, "the record name cannot be changed"));
     }
     std::lock_guard lock(connection_->mutex());
     if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
@@ -288,18 +289,29 @@ class LdapNode final : public DirectoryNode {
       return std::nullopt;
     }
     LDAP* ld = connection_->handle();
-    const std::string container = connection_->container(type);
     const std::string filter = std::string("(&(objectClass=") +
                                (type == RecordType::kUsers ? kUserClass : kGroupClass) + ")(" +
                                nameAttribute(type) + "=" + escapeFilterValue(recordName) + "))";
     const char* attrs[] = {ldapAttribute(type, returnAttribute), nullptr};
-    LDAPMessage* result = nullptr;
-    timeval timeout{kLdapOperationTimeoutSeconds, 0};
     const int limit = maxResults > 0x7fffffff ? 0 : static_cast<int>(maxResults);
-    const int rc =
-        ldap_search_ext_s(ld, container.c_str(), LDAP_SCOPE_ONELEVEL, filter.c_str(),
-                          const_cast<char**>(attrs), 0, nullptr, nullptr, &timeout, limit, &result);
-    Message message(result, ldap_msgfree);
+    Message message;
+    auto search = [&] {
+      LDAPMessage* result = nullptr;
+      timeval timeout{kLdapOperationTimeoutSeconds, 0};
+      const std::string container = connection_->container(type);
+      const int rc = ldap_search_ext_s(ld, container.c_str(), LDAP_SCOPE_ONELEVEL, filter.c_str(),
+                                       const_cast<char**>(attrs), 0, nullptr, nullptr, &timeout,
+                                       limit, &result);
+      message.reset(result, ldap_msgfree);
+      return rc;
+    };
+    int rc = search();
+    // A missing container may mean a base the server no longer has.
+    if (rc == LDAP_NO_SUCH_OBJECT && connection_->refreshStaleBase()) {
+      ld = connection_->handle();
+      rc = search();
+    }
+    LDAPMessage* result = message.get();
     std::vector<std::unique_ptr<DirectoryRecord>> records;
     // A container the session may not see holds nothing it may read.
     if (rc == LDAP_NO_SUCH_OBJECT) return records;
@@ -365,8 +377,18 @@ class LdapNode final : public DirectoryNode {
     for (const auto& [attribute, list] : values) {
       mods.add(LDAP_MOD_ADD, ldapAttribute(type, attribute), list);
     }
-    const std::string dn = connection_->recordDn(type, recordName);
-    const int rc = ldap_add_ext_s(connection_->handle(), dn.c_str(), mods.get(), nullptr, nullptr);
+    std::string dn = connection_->recordDn(type, recordName);
+    int rc = ldap_add_ext_s(connection_->handle(), dn.c_str(), mods.get(), nullptr, nullptr);
+    if (rc == LDAP_NO_SUCH_OBJECT) {
+      // A missing container may mean a base the server no longer has.
+      Error first = connection_->error(rc);
+      if (!connection_->refreshStaleBase()) {
+        setError(error, std::move(first));
+        return nullptr;
+      }
+      dn = connection_->recordDn(type, recordName);
+      rc = ldap_add_ext_s(connection_->handle(), dn.c_str(), mods.get(), nullptr, nullptr);
+    }
     if (rc != LDAP_SUCCESS) {
       setError(error, connection_->error(rc));
       return nullptr;
@@ -407,8 +429,9 @@ std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeNam
     setError(error, directoryError(LDAP_PARAM_ERROR, "not a directory node name"));
     return nullptr;
   }
-  // Opening connects, reads the root DSE and, on ldapi, binds as the local
-  // superuser: a node that opens is one whose server answered.
+  // Opening connects, finds the search base (from the Env's cache, or the
+  // root DSE) and, on ldapi, binds as the local superuser: a node that opens
+  // is one whose server answered.
   const bool ldaps = address->scheme == LdapScheme::kLdaps;
   auto connection = std::make_shared<LdapConnection>(env, *address);
   {

@@ -12,8 +12,10 @@
 namespace kolt {
 
 // A node over LDAP (libldap). Opening connects to the server and reads its
-// root DSE (on ldapi it also binds as the local superuser); the connection
-// is kept for the node's operations. Fails with -9 when the name is no node
+// root DSE for the search base, unless `env`'s search-base cache knows the
+// server (on ldapi it also binds as the local superuser); the connection is
+// kept for the node's operations. A cached base that an operation finds
+// wrong is read anew once (docs/directory.md). Fails with -9 when the name is no node
 // name (or its ldapi socket path is too long), with the client's code when
 // the server cannot be reached (-1 "Can't contact LDAP server") or fails
 // the TLS handshake. An ldaps:// server whose certificate is not trusted yet
