@@ -1,10 +1,12 @@
 #include "platform/directory/ldap_connection.h"
 
 #include <poll.h>
+#include <pthread.h>
 #include <string.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <memory>
 
 #include "platform/directory/directory_error.h"
@@ -28,6 +30,29 @@ timeval operationTimeout() {
 
 }  // namespace
 
+SigpipeBlock::SigpipeBlock() {
+  sigset_t pipe;
+  sigemptyset(&pipe);
+  sigaddset(&pipe, SIGPIPE);
+  sigset_t pending;
+  sigemptyset(&pending);
+  ::sigpending(&pending);
+  wasPending_ = sigismember(&pending, SIGPIPE) == 1;
+  ::pthread_sigmask(SIG_BLOCK, &pipe, &previous_);
+}
+
+SigpipeBlock::~SigpipeBlock() {
+  sigset_t pipe;
+  sigemptyset(&pipe);
+  sigaddset(&pipe, SIGPIPE);
+  if (!wasPending_) {
+    const timespec zero{};
+    while (::sigtimedwait(&pipe, nullptr, &zero) < 0 && errno == EINTR) {
+    }
+  }
+  ::pthread_sigmask(SIG_SETMASK, &previous_, nullptr);
+}
+
 LdapConnection::LdapConnection(Env& env, NodeAddress address)
     : env_(env), address_(std::move(address)) {
   // An ldapi server is known by the socket it is reached through: the same
@@ -38,6 +63,7 @@ LdapConnection::LdapConnection(Env& env, NodeAddress address)
 }
 
 LdapConnection::~LdapConnection() {
+  SigpipeBlock block;  // the unbind may meet a closed connection
   drop();
   explicit_bzero(password_.data(), password_.size());
 }

@@ -4,6 +4,7 @@
 #define KOLT_PLATFORM_DIRECTORY_LDAP_CONNECTION_H
 
 #include <ldap.h>
+#include <signal.h>
 
 #include <mutex>
 #include <optional>
@@ -21,6 +22,23 @@ namespace kolt {
 inline constexpr int kLdapConnectTimeoutSeconds = 10;
 inline constexpr int kLdapOperationTimeoutSeconds = 60;
 
+// Keeps SIGPIPE from the calling thread while it lives. libldap (and
+// OpenSSL's socket I/O) write with write(2): a request on a connection that
+// the server has closed, an ldapi socket above all, would otherwise end the
+// caller's process. A SIGPIPE raised meanwhile is consumed; one pending
+// before is left as it was.
+class SigpipeBlock {
+ public:
+  SigpipeBlock();
+  ~SigpipeBlock();
+  SigpipeBlock(const SigpipeBlock&) = delete;
+  SigpipeBlock& operator=(const SigpipeBlock&) = delete;
+
+ private:
+  sigset_t previous_;
+  bool wasPending_ = false;
+};
+
 class LdapConnection {
  public:
   LdapConnection(Env& env, NodeAddress address);
@@ -28,8 +46,16 @@ class LdapConnection {
   LdapConnection(const LdapConnection&) = delete;
   LdapConnection& operator=(const LdapConnection&) = delete;
 
-  // Every call below needs this held.
-  std::mutex& mutex() { return mutex_; }
+  // Every call below needs one of these alive: the connection's mutex held
+  // and SIGPIPE kept away.
+  class Use {
+   public:
+    explicit Use(LdapConnection& connection) : lock_(connection.mutex_) {}
+
+   private:
+    SigpipeBlock block_;
+    std::lock_guard<std::mutex> lock_;
+  };
   Env& env() { return env_; }
   const NodeAddress& address() const { return address_; }
 
@@ -51,8 +77,15 @@ class LdapConnection {
   // cached base are tried once more when the root DSE names other contexts.
   std::optional<Error> setCredentials(const std::string& name, const std::string& password);
 
+  // True for the results a wrong base explains, for an operation on a DN
+  // under the base: noSuchObject (32), and unwillingToPerform (53), which
+  // slapd answers for a DN under no suffix it serves.
+  static bool wrongBaseExplains(int rc) {
+    return rc == LDAP_NO_SUCH_OBJECT || rc == LDAP_UNWILLING_TO_PERFORM;
+  }
+
   // For an operation under the base that failed in a way a wrong base
-  // explains (noSuchObject). When the base came from the Env's cache and was
+  // explains (see above). When the base came from the Env's cache and was
   // not confirmed on this connection yet, reads the root DSE once and
   // chooses the base anew, dropping the cache entry when the server's
   // contexts changed. True when the base changed, so the operation is worth

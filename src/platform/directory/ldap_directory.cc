@@ -159,7 +159,7 @@ class LdapRecord final : public DirectoryRecord {
   std::optional<std::vector<std::string_view>> valuesForAttribute(Attribute attribute,
                                                                   ErrorSlot* error) override {
     if (auto it = views_.find(attribute); it != views_.end()) return it->second;
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     if (auto e = connection_->ready()) return failWithNothing(error, std::move(*e));
     LDAP* ld = connection_->handle();
     const char* attrs[] = {ldapAttribute(type_, attribute), nullptr};
@@ -186,7 +186,7 @@ class LdapRecord final : public DirectoryRecord {
       return failWithFalse(error,
                            directoryError(LDAP_NOT_SUPPORTED, "the record name cannot be changed"));
     }
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
     Modifications mods;
     mods.add(LDAP_MOD_REPLACE, ldapAttribute(type_, attribute), values);
@@ -208,7 +208,7 @@ class LdapRecord final : public DirectoryRecord {
     if (newPassword.empty()) {
       return failWithFalse(error, directoryError(LDAP_PARAM_ERROR, "an empty password is refused"));
     }
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
     berval user{static_cast<ber_len_t>(dn_.size()), dn_.data()};
     berval next{static_cast<ber_len_t>(newPassword.size()), const_cast<char*>(newPassword.data())};
@@ -228,7 +228,7 @@ class LdapRecord final : public DirectoryRecord {
     if (type_ != RecordType::kGroups || user == nullptr || user->type_ != RecordType::kUsers) {
       return failWithFalse(error, directoryError(LDAP_PARAM_ERROR, "a group takes user records"));
     }
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
     Modifications mods;
     mods.add(LDAP_MOD_ADD, "member", {user->dn_});
@@ -242,7 +242,7 @@ class LdapRecord final : public DirectoryRecord {
   }
 
   bool deleteRecord(ErrorSlot* error) override {
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     if (auto e = connection_->ready()) return failWithFalse(error, std::move(*e));
     const int rc = ldap_delete_ext_s(connection_->handle(), dn_.c_str(), nullptr, nullptr);
     if (rc != LDAP_SUCCESS) return failWithFalse(error, connection_->error(rc));
@@ -272,7 +272,7 @@ class LdapNode final : public DirectoryNode {
       setError(error, directoryError(LDAP_PARAM_ERROR, "credentials are those of a user"));
       return false;
     }
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     if (auto e = connection_->setCredentials(recordName, password)) {
       setError(error, std::move(*e));
       return false;
@@ -283,7 +283,7 @@ class LdapNode final : public DirectoryNode {
   std::optional<std::vector<std::unique_ptr<DirectoryRecord>>> queryRecords(
       RecordType type, const std::string& recordName, Attribute returnAttribute,
       std::size_t maxResults, ErrorSlot* error) override {
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     if (auto e = connection_->ready()) {
       setError(error, std::move(*e));
       return std::nullopt;
@@ -307,7 +307,7 @@ class LdapNode final : public DirectoryNode {
     };
     int rc = search();
     // A missing container may mean a base the server no longer has.
-    if (rc == LDAP_NO_SUCH_OBJECT && connection_->refreshStaleBase()) {
+    if (LdapConnection::wrongBaseExplains(rc) && connection_->refreshStaleBase()) {
       ld = connection_->handle();
       rc = search();
     }
@@ -359,7 +359,7 @@ class LdapNode final : public DirectoryNode {
     if (type == RecordType::kUsers && values.count(Attribute::kFullName) == 0) {
       values[Attribute::kFullName] = {recordName};
     }
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     if (auto e = connection_->ready()) {
       setError(error, std::move(*e));
       return nullptr;
@@ -379,7 +379,7 @@ class LdapNode final : public DirectoryNode {
     }
     std::string dn = connection_->recordDn(type, recordName);
     int rc = ldap_add_ext_s(connection_->handle(), dn.c_str(), mods.get(), nullptr, nullptr);
-    if (rc == LDAP_NO_SUCH_OBJECT) {
+    if (LdapConnection::wrongBaseExplains(rc)) {
       // A missing container may mean a base the server no longer has.
       Error first = connection_->error(rc);
       if (!connection_->refreshStaleBase()) {
@@ -403,7 +403,7 @@ class LdapNode final : public DirectoryNode {
       setError(error, directoryError(LDAP_NOT_SUPPORTED, "no such custom call"));
       return false;
     }
-    std::lock_guard lock(connection_->mutex());
+    LdapConnection::Use use(*connection_);
     std::vector<std::string> pems;
     std::optional<Error> e =
         fetchServerCaCertificates(connection_->address(), kLdapConnectTimeoutSeconds, &pems);
@@ -435,7 +435,7 @@ std::unique_ptr<DirectoryNode> openLdapNode(Env& env, const std::string& nodeNam
   const bool ldaps = address->scheme == LdapScheme::kLdaps;
   auto connection = std::make_shared<LdapConnection>(env, *address);
   {
-    std::lock_guard lock(connection->mutex());
+    LdapConnection::Use use(*connection);
     if (auto e = connection->ready()) {
       // An ldaps server whose certificate is not trusted yet still answers a
       // handshake that does not verify it. Its node opens, so that the

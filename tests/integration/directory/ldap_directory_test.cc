@@ -258,6 +258,30 @@ TEST_F(LdapDirectoryTest, LdapiSocketPathsLiveBelowTheRootAndStayShort) {
   EXPECT_EQ(error->code(), -1);
 }
 
+TEST_F(LdapDirectoryTest, AnLdapiNodeOutlivesAServerRestart) {
+  // A request written to a Unix socket whose server is gone raises SIGPIPE,
+  // which would end the caller's process: the node must notice and connect
+  // again, also when it is destroyed while the server is down.
+  std::unique_ptr<Slapd> own = Slapd::start();
+  ASSERT_NE(own, nullptr);
+  std::unique_ptr<Env> env = newPosixEnv("/");  // the socket's host path as it is
+  ErrorSlot error;
+  const std::string nodeName = "/LDAPv3/" + own->ldapiUrl();
+  auto node = env->openDirectoryNode(nodeName, &error);
+  ASSERT_NE(node, nullptr) << printed(error);
+  auto doomed = env->openDirectoryNode(nodeName, &error);
+  ASSERT_NE(doomed, nullptr) << printed(error);
+  ASSERT_TRUE(own->restart());
+  auto found =
+      node->queryRecords(RecordType::kUsers, own->adminName(), Attribute::kFullName, 1, &error);
+  ASSERT_TRUE(found) << printed(error);
+  EXPECT_EQ(found->size(), 1u);
+  ASSERT_TRUE(own->stop());
+  doomed.reset();
+  EXPECT_FALSE(
+      node->queryRecords(RecordType::kUsers, own->adminName(), Attribute::kFullName, 1, &error));
+}
+
 TEST_F(LdapDirectoryTest, APairOfServersReplicatesEachWay) {
   std::unique_ptr<Slapd> a, b;
   std::string startError;
