@@ -110,7 +110,6 @@ class LdapConnection {
   bool closedByServer() const;
   std::optional<Error> readNamingContexts(std::vector<std::string>* contexts);
   bool takeCachedBase();
-  bool refreshBase(bool probe);
   bool openingIdentity() const;
   void rememberBase();
   int simpleBind(const std::string& dn, const std::string& password);
