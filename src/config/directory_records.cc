@@ -1,6 +1,7 @@
 // Creating, reading, saving, destroying and removing a SAN's records.
 #include "kolt/directory_records.h"
 
+#include "config/fetched_configuration.h"
 #include "config/uuid_text.h"
 #include "kolt/controller_helpers.h"
 #include "kolt/env.h"
@@ -46,44 +47,9 @@ Value newVornConfig() {
 
 std::optional<Value> getVornConfig(DirectoryNode& node, const std::string* sanName,
                                    ErrorSlot* error) {
-  if (sanName == nullptr) {
-    setError(error, Error::vorn(kVornNoConfiguration));
-    return std::nullopt;
-  }
-  ErrorSlot slot;
-  LookUp found = lookUpRecord(node, RecordType::kGroups, ldapSanConfNameForName(*sanName), &slot);
-  if (!found.ok) {
-    if (slot) setError(error, std::move(*slot));
-    return std::nullopt;
-  }
-  if (!found.record) {
-    setError(error, Error::vorn(kVornNoConfiguration));
-    return std::nullopt;
-  }
-  auto values = found.record->valuesForAttribute(Attribute::kXMLPlist, &slot);
-  if (!values) {
-    if (slot) setError(error, std::move(*slot));
-    return std::nullopt;
-  }
-  if (values->empty()) {
-    setError(error, Error::posix(kPosixEINVAL, "The configuration record holds no configuration"));
-    return std::nullopt;
-  }
-  ErrorSlot parseError;
-  std::optional<Value> config = parsePropertyList(values->front(), &parseError);
-  if (!config) {
-    setError(error, Error::posix(kPosixEINVAL, parseError && parseError->description()
-                                                   ? *parseError->description()
-                                                   : "The configuration cannot be read"));
-    return std::nullopt;
-  }
-  // Every caller reads "globals" and "volumes" from it: anything but a
-  // dictionary is as unreadable as garbage.
-  if (!config->isDictionary()) {
-    setError(error, Error::posix(kPosixEINVAL, "The stored configuration is not a dictionary"));
-    return std::nullopt;
-  }
-  return config;
+  std::optional<FetchedConfiguration> record = FetchedConfiguration::fetch(node, sanName, error);
+  if (!record) return std::nullopt;
+  return record->parse(error);
 }
 
 std::optional<Value> getVornConfigForConfig(DirectoryNode& node, const Value& document,

@@ -2,6 +2,7 @@
 // revision; the apply step lives in change_apply.cc.
 #include "kolt/change_check.h"
 
+#include "config/fetched_configuration.h"
 #include "config/tool_paths.h"
 #include "kolt/controller_helpers.h"
 #include "kolt/directory.h"
@@ -12,7 +13,6 @@
 #include "kolt/log.h"
 #include "kolt/volume_files.h"
 #include "sync/change_apply.h"
-#include "sync/change_check_fetch.h"
 #include "volumes/key_operations.h"
 
 namespace kolt {

@@ -12,18 +12,14 @@
 namespace kolt {
 namespace {
 
-using testing::BuildWorld;
-using testing::kOtherUUID;
-using testing::kSanName;
-using testing::kSanUUID;
-using testing::kVornDir;
+using namespace testing::build_world;
 
 constexpr int kBusy = 51;  // LDAP "busy"
 
 struct Scenario {
   const char* name;
   std::function<void(BuildWorld&)> prepare;
-  std::string node = testing::kLocalNode;
+  std::string node = testing::build_world::kLocalNode;
   bool withAdminCredentials = false;
   // The existing record stays as it was unless the failing call came after
   // its new value was stored (synchronize, on a directory that stores at once).
@@ -47,7 +43,7 @@ std::vector<Scenario> scenarios() {
          d.set("metadataNetwork", "10.1.0.0/16");
          w.writeLocal(d);
        }},
-      {"a later build republishes", publishFirst, testing::kLocalNode, false, true},
+      {"a later build republishes", publishFirst, testing::build_world::kLocalNode, false, true},
       {"an initializing controller replaces a dead record",
        [](BuildWorld& w) {
          Value dead = newVornConfig();

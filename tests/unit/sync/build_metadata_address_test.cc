@@ -10,8 +10,7 @@ namespace kolt {
 namespace {
 
 using testing::FaultEnv;
-using testing::ipv4;
-using testing::ipv6;
+using namespace testing::build_world;
 using testing::Sandbox;
 using testing::StderrCapture;
 

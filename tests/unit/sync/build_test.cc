@@ -19,13 +19,7 @@
 namespace kolt {
 namespace {
 
-using testing::BuildWorld;
-using testing::kOtherUUID;
-using testing::kOurUUID;
-using testing::kSanName;
-using testing::kSanUUID;
-using testing::kSecret;
-using testing::kVornDir;
+using namespace testing::build_world;
 using testing::LogCapture;
 using testing::StderrCapture;
 
@@ -262,7 +256,7 @@ INSTANTIATE_TEST_SUITE_P(Changes, BuildChangeTest,
 
 TEST_F(BuildTest, NewControllerJoinsEveryVolumeRenewsTheCertificateSetAndWritesItsFiles) {
   world_.seedRecord(recordOfAnotherController());
-  Value local = testing::controllerDocument();
+  Value local = testing::build_world::controllerDocument();
   local.set("sanState", "active");
   world_.writeLocal(local);
 
@@ -507,7 +501,7 @@ TEST_F(BuildTest, AddressComesFromTheMetadataNetworkUnlessOneIsSet) {
   local.set("metadataNetwork", "10.1.0.0/16");
   world_.writeLocal(local);
   world_.faults.fakeInterfaceAddresses(
-      {testing::ipv4("lo0", 10, 1, 9, 9), testing::ipv4("en0", 10, 1, 2, 3)});
+      {testing::build_world::ipv4("lo0", 10, 1, 9, 9), testing::build_world::ipv4("en0", 10, 1, 2, 3)});
 
   StderrCapture err;
   ASSERT_EQ(world_.build(), 0);
@@ -545,7 +539,7 @@ TEST_F(BuildTest, CredentialsAreSetOnARemoteNodeOnly) {
   const std::string password = world_.directory->adminPassword();
   EXPECT_EQ(buildSanConfig(&remote, &admin, &password, nullptr), 0);
   // On the local node, credentials (even wrong ones) are not used.
-  const std::string local = testing::kLocalNode;
+  const std::string local = testing::build_world::kLocalNode;
   EXPECT_EQ(buildSanConfig(&local, &admin, &wrong, nullptr), 0);
   EXPECT_EQ(world_.directory->callCount(DirectoryOperation::kSetCredentials), 2u);
 }
@@ -568,13 +562,13 @@ TEST_F(BuildTest, SecretNeverReachesALogLineOrStandardError) {
 
 TEST_F(BuildTest, StringFormHandsOutAnAllocatedMessageOnFailureAndNullOnSuccess) {
   char* message = reinterpret_cast<char*>(0x1);
-  EXPECT_EQ(buildSanConfigC(testing::kLocalNode, nullptr, nullptr, &message), 0);
+  EXPECT_EQ(buildSanConfigC(testing::build_world::kLocalNode, nullptr, nullptr, &message), 0);
   EXPECT_EQ(message, nullptr);
 
   Value d = world_.local();
   d.set("role", "CLIENT");
   world_.writeLocal(d);
-  EXPECT_EQ(buildSanConfigC(testing::kLocalNode, "user", "password", &message), 22);
+  EXPECT_EQ(buildSanConfigC(testing::build_world::kLocalNode, "user", "password", &message), 22);
   ASSERT_NE(message, nullptr);
   EXPECT_STREQ(message, "System is not a controller");
   std::free(message);
@@ -586,7 +580,7 @@ TEST_F(BuildTest, StringFormHandsOutAnAllocatedMessageOnFailureAndNullOnSuccess)
 TEST_F(BuildTest, CFFormHandsOutTheSameErrorObject) {
   world_.sandbox.removeFile(kVornDir + "config.plist");
   ErrorSlot a, b;
-  const std::string node = testing::kLocalNode;
+  const std::string node = testing::build_world::kLocalNode;
   EXPECT_EQ(buildSanConfig(&node, nullptr, nullptr, &a), 2);
   EXPECT_EQ(buildSanConfigCF(&node, nullptr, nullptr, &b), 2);
   ASSERT_TRUE(a && b);

@@ -20,7 +20,9 @@
 #include "kolt/directory_records.h"
 #include "kolt/local_config.h"
 
-namespace kolt::testing {
+// Its own namespace: the change-check tests, linked into the same binary,
+// have constants of the same names.
+namespace kolt::testing::build_world {
 
 inline constexpr const char* kOurUUID = "5A5A5A5A-1111-4222-8333-444444444444";
 inline constexpr const char* kOtherUUID = "0B0B0B0B-1111-4222-8333-444444444444";
@@ -128,6 +130,6 @@ struct BuildWorld {
   Value cached;
 };
 
-}  // namespace kolt::testing
+}  // namespace kolt::testing::build_world
 
 #endif  // KOLT_TESTS_UNIT_SYNC_BUILD_WORLD_H

@@ -1,9 +1,9 @@
-// The change check's fetch: the SAN's configuration record, read as bytes,
-// whose "globals" can be read without parsing the whole configuration. Most
-// checks find the revision unchanged, and a configuration of a thousand
-// volumes takes far longer to parse than to fetch.
-#ifndef KOLT_SYNC_CHANGE_CHECK_FETCH_H
-#define KOLT_SYNC_CHANGE_CHECK_FETCH_H
+// The SAN's configuration record, read as bytes: parsed whole by
+// getVornConfig, or only its "globals" by the change check, which most often
+// finds the revision unchanged (a configuration of a thousand volumes takes
+// far longer to parse than to fetch).
+#ifndef KOLT_CONFIG_FETCHED_CONFIGURATION_H
+#define KOLT_CONFIG_FETCHED_CONFIGURATION_H
 
 #include <memory>
 #include <optional>
@@ -48,4 +48,4 @@ std::optional<std::pair<std::size_t, std::size_t>> findGlobalsInXml(std::string_
 
 }  // namespace kolt
 
-#endif  // KOLT_SYNC_CHANGE_CHECK_FETCH_H
+#endif  // KOLT_CONFIG_FETCHED_CONFIGURATION_H

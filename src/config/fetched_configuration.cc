@@ -1,4 +1,4 @@
-#include "sync/change_check_fetch.h"
+#include "config/fetched_configuration.h"
 
 #include <expat.h>
 #include <strings.h>

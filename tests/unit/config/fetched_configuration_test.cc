@@ -1,6 +1,6 @@
 // Reading the globals of a stored configuration without parsing the rest,
 // and what the check does with what it reads.
-#include "sync/change_check_fetch.h"
+#include "config/fetched_configuration.h"
 
 #include <gtest/gtest.h>
 
