@@ -6,6 +6,7 @@
 #include <memory>
 
 #include "platform/directory/directory_error.h"
+#include "platform/directory/new_record_values.h"
 #include "platform/directory/ldap_connection.h"
 #include "platform/directory/ldap_escape.h"
 #include "platform/directory/server_certificates.h"
@@ -346,18 +347,10 @@ class LdapNode final : public DirectoryNode {
       setError(error, directoryError(LDAP_INVALID_DN_SYNTAX, "empty record name"));
       return nullptr;
     }
-    std::map<Attribute, std::vector<std::string>> values;
-    for (const auto& [attribute, list] : attributes) {
-      if (attribute == Attribute::kRecordName) {
-        if (list.size() == 1 && list[0] == recordName) continue;
-        setError(error, directoryError(LDAP_NOT_SUPPORTED, "records have one name"));
-        return nullptr;
-      }
-      if (!list.empty()) values[attribute] = list;
-    }
-    // A user's full name (cn) is mandatory; it defaults to the name.
-    if (type == RecordType::kUsers && values.count(Attribute::kFullName) == 0) {
-      values[Attribute::kFullName] = {recordName};
+    AttributeValues values;
+    if (auto e = newRecordValues(type, recordName, attributes, &values)) {
+      setError(error, std::move(*e));
+      return nullptr;
     }
     LdapConnection::Use use(*connection_);
     if (auto e = connection_->ready()) {

@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "platform/directory/directory_error.h"
+#include "platform/directory/new_record_values.h"
 #include "platform/directory/node_address.h"
 
 namespace kolt {
@@ -325,19 +326,16 @@ class MemoryNode final : public DirectoryNode {
       setError(error, directoryError(LDAP_INVALID_DN_SYNTAX, "empty record name"));
       return nullptr;
     }
-    std::map<Attribute, std::vector<std::string>> values;
-    for (const auto& [attribute, list] : attributes) {
-      if (attribute == Attribute::kRecordName) {
-        if (list.size() == 1 && list[0] == recordName) continue;
-        setError(error, directoryError(LDAP_NOT_SUPPORTED, "records have one name"));
-        return nullptr;
-      }
-      if (list.empty()) continue;
+    AttributeValues values;
+    if (auto e = newRecordValues(type, recordName, attributes, &values)) {
+      setError(error, std::move(*e));
+      return nullptr;
+    }
+    for (const auto& [attribute, list] : values) {
       if (auto e = checkValues(type, attribute, list)) {
         setError(error, std::move(*e));
         return nullptr;
       }
-      values[attribute] = list;
     }
     const std::string key = MemoryDirectory::matchKey(recordName);
     if (type == RecordType::kUsers) {
@@ -345,8 +343,6 @@ class MemoryNode final : public DirectoryNode {
         setError(error, directoryError(LDAP_ALREADY_EXISTS));
         return nullptr;
       }
-      // The full name is mandatory in LDAP (cn); it defaults to the name.
-      if (values.count(Attribute::kFullName) == 0) values[Attribute::kFullName] = {recordName};
       dir_->usersLocked()[key] =
           MemoryDirectory::UserEntry{recordName, values[Attribute::kFullName], {}};
     } else {

@@ -4,6 +4,7 @@
 
 #include "fixtures/log_capture.h"
 #include "fixtures/sandbox.h"
+#include "fixtures/shared_slapd_test.h"
 #include "fixtures/slapd.h"
 #include "kolt/controller_helpers.h"
 #include "kolt/directory.h"
@@ -11,18 +12,8 @@
 namespace kolt::testing {
 namespace {
 
-class LoadControllerCertsLdapTest : public ::testing::Test {
+class LoadControllerCertsLdapTest : public SharedSlapdTest {
  protected:
-  static void SetUpTestSuite() {
-    std::string error;
-    server_ = Slapd::start({}, &error).release();
-    if (server_ == nullptr) startError_ = new std::string(error);
-  }
-  static void TearDownTestSuite() {
-    delete server_;
-    server_ = nullptr;
-  }
-  void SetUp() override { ASSERT_NE(server_, nullptr) << (startError_ ? *startError_ : ""); }
 
   // Binds as the administrator over ldaps, verifying the server.
   static bool verifiedBind(ErrorSlot* error) {
@@ -30,13 +21,7 @@ class LoadControllerCertsLdapTest : public ::testing::Test {
     return node && node->setCredentials(kRecordTypeUsers, server_->adminName(),
                                         server_->adminPassword(), error);
   }
-
-  static Slapd* server_;
-  static std::string* startError_;
 };
-
-Slapd* LoadControllerCertsLdapTest::server_ = nullptr;
-std::string* LoadControllerCertsLdapTest::startError_ = nullptr;
 
 TEST_F(LoadControllerCertsLdapTest, TrustsTheServerNamedByAnyFormOfItsUrl) {
   // The configuration names controllers as ldap:// or ldaps:// URLs with a

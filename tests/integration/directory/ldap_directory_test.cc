@@ -14,6 +14,7 @@
 #include <filesystem>
 #include <thread>
 
+#include "fixtures/shared_slapd_test.h"
 #include "fixtures/slapd.h"
 #include "kolt/directory.h"
 #include "kolt/env.h"
@@ -62,18 +63,8 @@ class Sandbox {
   std::unique_ptr<Env> env_;
 };
 
-class LdapDirectoryTest : public ::testing::Test {
+class LdapDirectoryTest : public SharedSlapdTest {
  protected:
-  static void SetUpTestSuite() {
-    std::string error;
-    server_ = Slapd::start({}, &error).release();
-    if (server_ == nullptr) startError_ = new std::string(error);
-  }
-  static void TearDownTestSuite() {
-    delete server_;
-    server_ = nullptr;
-  }
-  void SetUp() override { ASSERT_NE(server_, nullptr) << (startError_ ? *startError_ : ""); }
 
   Slapd& server() { return *server_; }
 
@@ -88,13 +79,7 @@ class LdapDirectoryTest : public ::testing::Test {
     }
     return node;
   }
-
-  static Slapd* server_;
-  static std::string* startError_;
 };
-
-Slapd* LdapDirectoryTest::server_ = nullptr;
-std::string* LdapDirectoryTest::startError_ = nullptr;
 
 TEST_F(LdapDirectoryTest, LdapsVerifiesTheServerAgainstKoltsTrustStore) {
   Sandbox sandbox;
