@@ -10,12 +10,11 @@
 #include "kolt/change_check.h"
 #include "kolt/controller_helpers.h"
 #include "unit/sync/change_check_support.h"
+#include "unit/sync/memory_member_test.h"
 
 namespace kolt::testing {
 namespace {
 
-constexpr const char* kUrl1 = "ldap://10.0.0.1";
-constexpr const char* kUrl2 = "ldap://10.0.0.2";
 constexpr const char* kCopiedKeys[] = {
     "sanConfigURLs", "desiredSearchPolicy", "notifications", "ownerEmail",     "ownerName",
     "sanAuthMethod", "primaryZombie",       "sanState",      "certSetRevision"};
@@ -46,20 +45,8 @@ class CreationModeEnv : public EnvWrapper {
   std::vector<mode_t> secretModes;
 };
 
-class ChangeApplyTest : public ::testing::Test {
+class ChangeApplyTest : public MemoryMemberTest {
  protected:
-  ChangeApplyTest()
-      : directory_(MemoryDirectory::create()),
-        machine_(directory_, kMemberUUID),
-        scoped_(&machine_.env()) {}
-
-  void publishConfig(const Value& config) {
-    auto node = directory_->openNode("/LDAPv3/" + std::string(kUrl1), nullptr);
-    ASSERT_TRUE(node->setCredentials(kRecordTypeUsers, directory_->adminName(),
-                                     directory_->adminPassword(), nullptr));
-    std::string why;
-    ASSERT_TRUE(publish(*node, config, &why)) << why;
-  }
   // The published configuration at a new revision, with `change` applied.
   template <class Change>
   void publishChange(Change change) {
@@ -86,13 +73,8 @@ class ChangeApplyTest : public ::testing::Test {
   std::optional<std::string> file(const std::string& name) {
     return machine_.sandbox().readFile(vornFile(name));
   }
-  ProcessRecorder& recorder() { return machine_.processes(); }
   std::size_t unloads() { return recorder().countOf("vornctl unloadProfile"); }
 
-  std::shared_ptr<MemoryDirectory> directory_;
-  MemoryMachine machine_;
-  ScopedEnv scoped_;
-  std::uint32_t mask_ = 0;
   int revisions_ = 100;
 };
 

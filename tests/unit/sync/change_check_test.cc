@@ -7,32 +7,19 @@
 #include "fixtures/log_capture.h"
 #include "kolt/controller_helpers.h"
 #include "unit/sync/change_check_support.h"
+#include "unit/sync/memory_member_test.h"
 
 namespace kolt::testing {
 namespace {
 
-constexpr const char* kUrl1 = "ldap://10.0.0.1";
-constexpr const char* kUrl2 = "ldap://10.0.0.2";
 constexpr const char* kLocalNode = "/LDAPv3/ldapi://%2Fvar%2Frun%2Fldapi";
 
 Error contactError() {
   return Error(std::string(kDirectoryErrorDomain), -1, "Can't contact LDAP server");
 }
 
-class ChangeCheckTest : public ::testing::Test {
+class ChangeCheckTest : public MemoryMemberTest {
  protected:
-  ChangeCheckTest()
-      : directory_(MemoryDirectory::create()),
-        machine_(directory_, kMemberUUID),
-        scoped_(&machine_.env()) {}
-
-  void publishConfig(const Value& config) {
-    auto node = directory_->openNode("/LDAPv3/" + std::string(kUrl1), nullptr);
-    ASSERT_TRUE(node->setCredentials(kRecordTypeUsers, directory_->adminName(),
-                                     directory_->adminPassword(), nullptr));
-    std::string why;
-    ASSERT_TRUE(publish(*node, config, &why)) << why;
-  }
   // A member of the SAN at kUrl1 (and kUrl2), holding the secret.
   void joinedMember(const char* role = "CLIENT", const char* sanRevision = kRevision1) {
     ASSERT_TRUE(saveConfigPlist(memberDocument(stringArray({kUrl1, kUrl2}), role, sanRevision)));
@@ -43,12 +30,7 @@ class ChangeCheckTest : public ::testing::Test {
     return checkSanConfigChangeWithServer(server, &mask_, newConfig);
   }
   FileSnapshot files() { return snapshotFiles(machine_.sandbox().root()); }
-  ProcessRecorder& recorder() { return machine_.processes(); }
 
-  std::shared_ptr<MemoryDirectory> directory_;
-  MemoryMachine machine_;
-  ScopedEnv scoped_;
-  std::uint32_t mask_ = 0;
 };
 
 TEST_F(ChangeCheckTest, WithoutAMaskNothingIsReadOrChanged) {
